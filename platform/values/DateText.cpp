@@ -68,7 +68,8 @@ std::optional<Date> parseIso8601(std::string_view s) {
     std::size_t n = 1;
     while (n < s.size() && s[n] >= '0' && s[n] <= '9') ++n;
     if (n == 1 || n > 400) return std::nullopt;
-    std::string text = "0" + std::string(s.substr(0, n));
+    std::string text("0");
+    text.append(s.substr(0, n));
     auto res = std::from_chars(text.data(), text.data() + text.size(), fraction);
     if (res.ec != std::errc()) return std::nullopt;
     s.remove_prefix(n);

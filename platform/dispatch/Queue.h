@@ -1,0 +1,63 @@
+// A queue is a named place where work runs. Everything outside the dispatch
+// layer runs as work on some queue; "which queue am I on" is the question
+// code asks instead of "which thread am I on".
+//
+// Thread safety: all members are safe to call from any thread.
+#pragma once
+
+#include <memory>
+#include <string>
+#include <string_view>
+
+#include "platform/dispatch/Priority.h"
+#include "platform/dispatch/internal/Closure.h"
+
+namespace platform::dispatch {
+
+class Queue : public std::enable_shared_from_this<Queue> {
+ public:
+  virtual ~Queue();
+  Queue(const Queue&) = delete;
+  Queue& operator=(const Queue&) = delete;
+
+  const std::string& label() const { return label_; }
+  Priority priority() const { return priority_; }
+
+  // Runs `work` on this queue later; returns at once. An exception escaping
+  // `work` ends the process.
+  virtual void async(Closure work) = 0;
+
+  // Runs `work` on this queue and returns when it has finished. Whether the
+  // calling thread runs it or waits for another depends on the queue kind.
+  // REQUIRES: for a serial or the main queue, the queue is not current
+  //           (that would wait on itself; the process aborts instead).
+  virtual void sync(Closure work) = 0;
+
+  // True while the calling code runs as work of this queue, including inside
+  // a chain of syncs that started on it.
+  bool isCurrent() const;
+
+  // Aborts, naming this queue and the queue actually current, unless
+  // isCurrent(). `file` and `line` name the caller; see QV_ASSERT_ON_QUEUE.
+  void assertCurrent(const char* file = nullptr, int line = 0) const;
+
+ protected:
+  // Labels longer than kMaxLabelLength are cut to that length.
+  Queue(std::string_view label, Priority priority);
+
+ private:
+  const std::string label_;
+  const Priority priority_;
+};
+
+inline constexpr std::size_t kMaxLabelLength = 128;
+
+// The label of the innermost current queue, or "" when the calling code is
+// not running on any queue. Meant for log lines.
+std::string currentQueueLabel();
+
+}  // namespace platform::dispatch
+
+// Aborts unless the calling code runs on `queue` (a pointer or smart pointer
+// to a Queue). Use it at the top of methods of objects confined to a queue.
+#define QV_ASSERT_ON_QUEUE(queue) ((queue)->assertCurrent(__FILE__, __LINE__))

@@ -1,0 +1,68 @@
+// Helpers shared by the dispatch tests.
+#pragma once
+
+#include <chrono>
+#include <filesystem>
+#include <fstream>
+#include <functional>
+#include <string>
+#include <thread>
+
+#include "platform/dispatch/internal/ThreadPool.h"
+
+namespace platform::dispatch::testing {
+
+using namespace std::chrono_literals;
+
+// Polls `done` until it holds or `limit` passes; answers whether it held.
+inline bool eventually(const std::function<bool()>& done, std::chrono::milliseconds limit = 5s) {
+  auto deadline = std::chrono::steady_clock::now() + limit;
+  while (!done()) {
+    if (std::chrono::steady_clock::now() > deadline) return false;
+    std::this_thread::sleep_for(1ms);
+  }
+  return true;
+}
+
+// "prefix<n>". (Spelled out: g++ 12 at -O3 warns falsely on "literal" + string.)
+inline std::string numbered(const char* prefix, int n) {
+  std::string s = prefix;
+  s += std::to_string(n);
+  return s;
+}
+
+// The "Threads:" line of /proc/self/status.
+inline int processThreadCount() {
+  std::ifstream status("/proc/self/status");
+  std::string line;
+  while (std::getline(status, line)) {
+    if (line.rfind("Threads:", 0) == 0) return std::stoi(line.substr(8));
+  }
+  return -1;
+}
+
+// How many of this process's threads are named `name`.
+inline int threadsNamed(const std::string& name) {
+  int count = 0;
+  for (const auto& task : std::filesystem::directory_iterator("/proc/self/task")) {
+    std::ifstream comm(task.path() / "comm");
+    std::string line;
+    if (std::getline(comm, line) && line == name) ++count;
+  }
+  return count;
+}
+
+// Changes the pool's limits for one test and puts them back after.
+class ScopedPoolLimits {
+ public:
+  explicit ScopedPoolLimits(internal::PoolLimits limits)
+      : saved_(internal::ThreadPool::instance().limits()) {
+    internal::ThreadPool::instance().setLimitsForTesting(limits);
+  }
+  ~ScopedPoolLimits() { internal::ThreadPool::instance().setLimitsForTesting(saved_); }
+
+ private:
+  internal::PoolLimits saved_;
+};
+
+}  // namespace platform::dispatch::testing

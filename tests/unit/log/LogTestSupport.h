@@ -1,0 +1,74 @@
+// Helpers shared by the log tests: a temporary file to send lines to, and a
+// fixture that puts the log layer back in its default state around a test.
+#pragma once
+
+#include <gtest/gtest.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cstdio>
+#include <cstdlib>
+#include <sstream>
+#include <string>
+#include <vector>
+
+#include "platform/log/LoggerRegistry.h"
+#include "platform/log/internal/Output.h"
+
+namespace platform::log::testing {
+
+// An anonymous file that log lines can be written to and read back from.
+class TempFile {
+ public:
+  TempFile() : file_(std::tmpfile()) {}
+  ~TempFile() { std::fclose(file_); }
+  TempFile(const TempFile&) = delete;
+  TempFile& operator=(const TempFile&) = delete;
+
+  int fd() const { return fileno(file_); }
+
+  // "device:inode", as journald puts it in JOURNAL_STREAM.
+  std::string journalStreamValue() const {
+    struct stat st {};
+    fstat(fd(), &st);
+    return std::to_string(st.st_dev) + ":" + std::to_string(st.st_ino);
+  }
+
+  std::vector<std::string> lines() const {
+    std::string all;
+    char buffer[4096];
+    for (ssize_t n; (n = pread(fd(), buffer, sizeof buffer, static_cast<off_t>(all.size()))) > 0;) {
+      all.append(buffer, static_cast<std::size_t>(n));
+    }
+    std::vector<std::string> out;
+    std::istringstream in(all);
+    for (std::string line; std::getline(in, line);) out.push_back(line);
+    return out;
+  }
+
+ private:
+  std::FILE* file_;
+};
+
+// Resets filter, environment and output around each test.
+class LogTest : public ::testing::Test {
+ protected:
+  void SetUp() override { reset(); }
+  void TearDown() override {
+    internal::Output::shared().setDescriptorForTesting(STDERR_FILENO);
+    reset();
+  }
+
+  static void reset() {
+    unsetenv("QV_LOG");
+    unsetenv("QV_LOG_PRIVATE");
+    unsetenv("JOURNAL_STREAM");
+    LoggerRegistry::shared().reloadEnvironmentForTesting();
+  }
+
+  static const Logger& logger(std::string_view subsystem, std::string_view category) {
+    return *LoggerRegistry::shared().logger(subsystem, category).value();
+  }
+};
+
+}  // namespace platform::log::testing

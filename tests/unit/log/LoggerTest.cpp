@@ -1,0 +1,192 @@
+#include "platform/log/Logger.h"
+
+#include <gtest/gtest.h>
+
+#include <atomic>
+#include <latch>
+#include <regex>
+#include <set>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "LogTestSupport.h"
+#include "platform/log/LogCaptureForTesting.h"
+#include "platform/log/LoggerRegistry.h"
+
+namespace platform::log {
+namespace {
+
+constexpr std::string_view kDaemon = "com.corvane.Quorvex";
+
+struct Counted {
+  mutable std::atomic<int> calls{0};
+  std::string description() const {
+    ++calls;
+    return "counted";
+  }
+};
+
+using LogLogger = testing::LogTest;
+
+TEST_F(LogLogger, NamesAreCheckedAndEachPairHasOneLogger) {
+  const std::pair<std::string, LoggerError> bad[] = {
+      {"", LoggerError::EmptyName},
+      {std::string(129, 's'), LoggerError::NameTooLong},
+      {"new\nline", LoggerError::InvalidCharacter},
+      {"a,b", LoggerError::InvalidCharacter},
+      {"caf\xC3\xA9", LoggerError::InvalidCharacter},
+  };
+  for (const auto& [name, error] : bad) {
+    for (auto [subsystem, category] : {std::pair{name, std::string("ops")}, {"com.x", name}}) {
+      Result<const Logger*> made = LoggerRegistry::shared().logger(subsystem, category);
+      ASSERT_FALSE(made.ok()) << subsystem << "/" << category;
+      EXPECT_EQ(made.error().domain(), kLoggerErrorDomain);
+      EXPECT_EQ(made.error().code(), static_cast<std::int64_t>(error));
+    }
+  }
+  EXPECT_EQ(LoggerRegistry::shared().logger("com.x", "new\nline").error().description(),
+            "invalid character in name for logger (com.x, new\\nline)");
+
+  const Logger& ops = logger(kDaemon, "ops");
+  EXPECT_EQ(&ops, &logger(kDaemon, "ops"));
+  EXPECT_NE(&ops, &logger(kDaemon, "traffic"));
+  EXPECT_NE(&ops, &logger("com.other", "ops"));
+  EXPECT_EQ(ops.category(), "ops");
+}
+
+TEST_F(LogLogger, LevelsAndDefaultThreshold) {
+  const Logger& l = logger(kDaemon, "ops");
+  LogCaptureForTesting capture;
+  l.debug("d");
+  l.info("i");
+  l.notice("n %d", 1);
+  l.error("e");
+  l.log(Level::Fault, "f");
+  std::vector<CapturedLine> lines = capture.lines();
+  ASSERT_EQ(lines.size(), 3u);
+  EXPECT_EQ(lines[0].level, Level::Default);
+  EXPECT_EQ(lines[0].message, "n 1");
+  EXPECT_EQ(lines[0].subsystem, kDaemon);
+  EXPECT_EQ(lines[0].category, "ops");
+  EXPECT_EQ(lines[1].level, Level::Error);
+  EXPECT_EQ(lines[2].level, Level::Fault);
+}
+
+TEST_F(LogLogger, DisabledLevelBuildsNoMessage) {
+  const Logger& l = logger(kDaemon, "hv");
+  Counted counted;
+  LogCaptureForTesting capture;
+  l.debug("%{public}@", counted);
+  l.info("%{public}@ %{public}@", counted, counted);
+  EXPECT_EQ(counted.calls.load(), 0);
+  l.notice("%{public}@", counted);
+  EXPECT_EQ(counted.calls.load(), 1);
+  LoggerRegistry::shared().applyFilterForTesting("hv=debug");
+  l.debug("%{public}@", counted);
+  EXPECT_EQ(counted.calls.load(), 2);
+  LoggerRegistry::shared().applyFilterForTesting("hv=off");
+  l.fault("%{public}@", counted);
+  EXPECT_EQ(counted.calls.load(), 2);
+  EXPECT_EQ(capture.size(), 2u);
+}
+
+TEST_F(LogLogger, LinesAreRedactedUnlessQvLogPrivateIsOne) {
+  const Logger& l = logger(kDaemon, "sandbox");
+  LogCaptureForTesting capture;
+  l.notice("open %s (%{public}s) %d", "/secret", "public", 3);
+  setenv("QV_LOG_PRIVATE", "1", 1);
+  LoggerRegistry::shared().reloadEnvironmentForTesting();
+  l.notice("open %s", "/secret");
+  setenv("QV_LOG_PRIVATE", "yes", 1);  // only "1" counts
+  LoggerRegistry::shared().reloadEnvironmentForTesting();
+  l.notice("open %s", "/secret");
+  EXPECT_EQ(capture.messages(), (std::vector<std::string>{"open <private> (public) 3",
+                                                          "open /secret", "open <private>"}));
+}
+
+TEST_F(LogLogger, ConcurrentFirstCreationGivesOneLogger) {
+  constexpr int kThreads = 16;
+  for (int round = 0; round < 20; ++round) {
+    std::string category = std::string("race") + std::to_string(round);
+    std::latch start(kThreads);
+    std::vector<const Logger*> seen(kThreads, nullptr);
+    std::vector<std::thread> threads;
+    for (int t = 0; t < kThreads; ++t) {
+      threads.emplace_back([&, t] {
+        start.arrive_and_wait();
+        seen[t] = LoggerRegistry::shared().logger("com.test.race", category).valueOr(nullptr);
+      });
+    }
+    for (std::thread& t : threads) t.join();
+    std::set<const Logger*> distinct(seen.begin(), seen.end());
+    ASSERT_EQ(distinct.size(), 1u) << category;
+    ASSERT_NE(*distinct.begin(), nullptr);
+  }
+}
+
+// Whole lines in the output file prove each line is one write(2); the
+// capture must see every line whole and each thread's lines in order.
+TEST_F(LogLogger, ConcurrentLoggingWritesWholeLines) {
+  constexpr int kThreads = 8;
+  constexpr int kLines = 1000;
+  testing::TempFile file;
+  internal::Output::shared().setDescriptorForTesting(file.fd());
+  LogCaptureForTesting capture(CaptureEcho::AlsoStderr);
+  const std::string payload(300, 'p');
+  std::latch start(kThreads);
+  std::vector<std::thread> threads;
+  for (int t = 0; t < kThreads; ++t) {
+    threads.emplace_back([&, t] {
+      const Logger& l = logger("com.test.lines", std::string("c") + std::to_string(t));
+      start.arrive_and_wait();
+      for (int i = 0; i < kLines; ++i) l.error("%d:%d %{public}s end", t, i, payload);
+    });
+  }
+  for (std::thread& t : threads) t.join();
+
+  std::vector<std::string> lines = file.lines();
+  ASSERT_EQ(lines.size(), static_cast<std::size_t>(kThreads * kLines));
+  const std::regex shape(R"(\d{4}-\d\d-\d\dT\d\d:\d\d:\d\d\.\d{6}Z [^\[]+\[\d+:\d+\] <Error> )"
+                         R"(\[com\.test\.lines:c(\d+)\] \1:(\d+) p{300} end)");
+  std::set<std::pair<int, int>> seen;
+  for (const std::string& line : lines) {
+    std::smatch m;
+    ASSERT_TRUE(std::regex_match(line, m, shape)) << line;
+    seen.emplace(std::stoi(m[1]), std::stoi(m[2]));
+  }
+  EXPECT_EQ(seen.size(), static_cast<std::size_t>(kThreads * kLines));
+
+  std::vector<CapturedLine> captured = capture.lines();
+  ASSERT_EQ(captured.size(), static_cast<std::size_t>(kThreads * kLines));
+  std::vector<int> next(kThreads, 0);
+  for (const CapturedLine& c : captured) {
+    int t = std::stoi(c.category.substr(1));
+    EXPECT_EQ(c.message,
+              std::to_string(t) + ":" + std::to_string(next[t]++) + " " + payload + " end");
+  }
+}
+
+TEST_F(LogLogger, CaptureSilencesOrEchoes) {
+  testing::TempFile file;
+  internal::Output::shared().setDescriptorForTesting(file.fd());
+  const Logger& l = logger(kDaemon, "ops");
+  {
+    LogCaptureForTesting silent;
+    l.notice("silent");
+    {
+      LogCaptureForTesting echoing(CaptureEcho::AlsoStderr);
+      l.notice("echoed");
+      EXPECT_EQ(echoing.messages(), std::vector<std::string>{"echoed"});
+    }
+    EXPECT_EQ(silent.messages(), (std::vector<std::string>{"silent", "echoed"}));
+  }
+  l.notice("plain");
+  std::vector<std::string> lines = file.lines();
+  ASSERT_EQ(lines.size(), 2u);
+  EXPECT_NE(lines[0].find("] echoed"), std::string::npos);
+  EXPECT_NE(lines[1].find("] plain"), std::string::npos);
+}
+
+}  // namespace
+}  // namespace platform::log
