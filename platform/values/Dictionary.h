@@ -40,6 +40,9 @@ class Dictionary {
   void set(std::string_view key, Value value);
   // Returns whether the key was present.
   bool remove(std::string_view key);
+  // Makes room for `n` entries, so that a decoder that knows the count
+  // appends without regrowing.
+  void reserve(std::size_t n) { entries_.reserve(n); }
 
   auto begin() const { return entries_.begin(); }
   auto end() const { return entries_.end(); }

@@ -153,7 +153,11 @@ bool Decoder::openContainer(const Head& head) {
   frame.remaining = head.argument;
   frame.isMap = isMap;
   frame.offset = head.offset;
-  if (!isMap) frame.elements.reserve(static_cast<std::size_t>(head.argument));
+  if (isMap) {
+    frame.entries.reserve(static_cast<std::size_t>(head.argument));
+  } else {
+    frame.elements.reserve(static_cast<std::size_t>(head.argument));
+  }
   return true;
 }
 
