@@ -27,11 +27,17 @@ bool expect(std::string_view& s, char c) {
   return true;
 }
 
+constexpr double kFirstSecond = -62167219200.0;  // 0000-01-01T00:00:00Z
+constexpr double kLastSecond = 253402300799.0;   // 9999-12-31T23:59:59Z
+
 }  // namespace
 
 std::string formatIso8601(Date date) {
   double t = date.secondsSince1970;
   if (!std::isfinite(t)) return t != t ? "nan" : (t > 0 ? "+infinity" : "-infinity");
+  // Years 0000-9999 only; beyond them the calendar types would overflow, and
+  // no document needs such dates, so describe them by their seconds.
+  if (t < kFirstSecond || t >= kLastSecond + 1) return "@" + std::to_string(t);
   double whole = std::floor(t);
   double fraction = t - whole;  // exact: both lie in the same binade range
   using namespace std::chrono;

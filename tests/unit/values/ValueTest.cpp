@@ -129,6 +129,9 @@ TEST(DateTextTest, FormatsAndParsesUtc) {
     ASSERT_TRUE(back) << t;
     EXPECT_EQ(back->secondsSince1970, t) << formatIso8601(Date{t});
   }
+  // Out of the calendar's range: described by seconds, never undefined.
+  EXPECT_EQ(formatIso8601(Date{1e300}).front(), '@');
+  EXPECT_EQ(formatIso8601(Date{-1e300}).front(), '@');
   for (const char* bad : {"2026-11-23 03:24:38Z", "2026-13-01T00:00:00Z", "2026-02-30T00:00:00Z",
                           "2026-11-23T03:24:38", "2026-11-23T03:24:38+01:00", "2026-11-23T03:24:38.Z",
                           "2026-11-23T24:00:00Z", ""}) {
