@@ -1,0 +1,69 @@
+// A client for the identity tests: connects to the socket named by argv[1],
+// confines itself as argv[3] says, answers one byte ('R' ready, 'S' the
+// confinement is not permitted here, 'F' it failed), then obeys one-byte
+// commands: 'e' runs argv[2] keeping the connection, 'q' or end of input
+// exits.
+//
+//   identity_peer SOCKET EXEC_TARGET plain|nnp|seccomp|mntns|name [NAME]
+#include <errno.h>
+#include <linux/filter.h>
+#include <linux/seccomp.h>
+#include <sched.h>
+#include <stddef.h>
+#include <string.h>
+#include <sys/prctl.h>
+#include <sys/socket.h>
+#include <sys/syscall.h>
+#include <sys/un.h>
+#include <unistd.h>
+
+#include <string>
+
+namespace {
+
+bool applySeccompAllowAll() {
+  struct sock_filter allow = BPF_STMT(BPF_RET | BPF_K, SECCOMP_RET_ALLOW);
+  struct sock_fprog program {};
+  program.len = 1;
+  program.filter = &allow;
+  return ::prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0) == 0 &&
+         ::syscall(SYS_seccomp, SECCOMP_SET_MODE_FILTER, 0, &program) == 0;
+}
+
+char confine(const std::string& mode, const char* name) {
+  if (mode == "plain") return 'R';
+  if (mode == "nnp") return ::prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0) == 0 ? 'R' : 'F';
+  if (mode == "seccomp") return applySeccompAllowAll() ? 'R' : 'F';
+  if (mode == "mntns") {
+    if (::unshare(CLONE_NEWNS) == 0) return 'R';
+    return errno == EPERM || errno == EINVAL ? 'S' : 'F';
+  }
+  if (mode == "name" && name != nullptr)
+    return ::prctl(PR_SET_NAME, name, 0, 0, 0) == 0 ? 'R' : 'F';
+  return 'F';
+}
+
+}  // namespace
+
+int main(int argc, char** argv) {
+  if (argc < 4) return 2;
+  // Not close-on-exec: the program run on 'e' keeps the connection.
+  const int fd = ::socket(AF_UNIX, SOCK_STREAM, 0);
+  struct sockaddr_un address {};
+  address.sun_family = AF_UNIX;
+  if (fd < 0 || ::strlen(argv[1]) >= sizeof address.sun_path) return 2;
+  ::strcpy(address.sun_path, argv[1]);
+  if (::connect(fd, reinterpret_cast<sockaddr*>(&address), sizeof address) != 0) return 2;
+
+  const char reply = confine(argv[3], argc > 4 ? argv[4] : nullptr);
+  if (::write(fd, &reply, 1) != 1) return 2;
+  for (;;) {
+    char command = 0;
+    if (::read(fd, &command, 1) != 1 || command == 'q') return 0;
+    if (command == 'e') {
+      const std::string fdText = std::to_string(fd);
+      ::execl(argv[2], argv[2], fdText.c_str(), static_cast<char*>(nullptr));
+      return 3;
+    }
+  }
+}
