@@ -1,0 +1,236 @@
+// The outgoing half of Connection: message ids, direct writes, the output
+// queue and its limit, and synchronous waits.
+#include <fcntl.h>
+#include <poll.h>
+#include <sys/socket.h>
+
+#include <cerrno>
+
+#include "platform/dispatch/ScopedBlockingCall.h"
+#include "platform/mbx/Connection.h"
+#include "platform/mbx/MbxError.h"
+#include "platform/mbx/internal/MbxLog.h"
+
+namespace platform::mbx {
+
+using internal::mbxLog;
+using internal::PendingReply;
+
+namespace {
+
+unsigned long long ull(std::uint64_t value) {
+  return static_cast<unsigned long long>(value);
+}
+
+}  // namespace
+
+void Connection::send(Value body) {
+  Result<std::vector<std::uint8_t>> frame = encodeFrame(FrameKind::Message, 0, body);
+  if (!frame.ok()) {
+    mbxLog().error("%{public}s: message not sent: %@", description(), frame.error());
+    return;
+  }
+  if (Status sent = transmit(std::move(frame).value(), nullptr); !sent.ok()) {
+    mbxLog().debug("%{public}s: message not sent: %@", description(), sent.error());
+  }
+}
+
+void Connection::sendWithReply(Value body, std::shared_ptr<dispatch::Queue> replyQueue,
+                               ReplyHandler handler) {
+  PendingReply pending{replyQueue ? std::move(replyQueue) : queue_, std::move(handler)};
+  Result<std::vector<std::uint8_t>> frame = encodeFrame(FrameKind::Request, 0, body);
+  if (!frame.ok()) {
+    std::move(pending).complete(frame.error());
+    return;
+  }
+  // transmit() takes the handler only when the request went out.
+  if (Status sent = transmit(std::move(frame).value(), &pending); !sent.ok()) {
+    std::move(pending).complete(sent.error());
+  }
+}
+
+Result<Message> Connection::sendWithReplySync(Value body) {
+  if (queue_->isCurrent()) {
+    return makeError(ErrorCode::WouldDeadlock,
+                     "a synchronous request on " + description() + " from its own delivery queue");
+  }
+  auto waiter = std::make_shared<SyncWaiter>();
+  // No queue: whoever reads the reply completes the wait directly.
+  PendingReply pending{nullptr, [waiter](Result<Message> outcome) {
+                         waiter->outcome.emplace(std::move(outcome));
+                         waiter->done.store(true, std::memory_order_release);
+                         waiter->signal.signal();
+                       }};
+  Result<std::vector<std::uint8_t>> frame = encodeFrame(FrameKind::Request, 0, body);
+  if (!frame.ok()) return frame.error();
+  std::shared_ptr<internal::SocketHandle> socket;
+  {
+    std::lock_guard<std::mutex> lock(mu_);
+    if (state_ == State::Suspended) return makeError(ErrorCode::NotResumed, description());
+    if (state_ == State::Active && !closing_ && !syncReader_) {
+      syncReader_ = true;
+      socket = socket_;
+    }
+  }
+  if (socket) {
+    // The waiting thread reads the reply itself: the reactor is told to
+    // leave the socket alone meanwhile, which saves two thread hops.
+    readSource_->suspend();
+    Status sent = transmit(std::move(frame).value(), &pending);
+    if (sent.ok()) readUntilDone(*waiter, socket->fd());
+    // Resumed before the role is given up: the next waiter's suspend() must
+    // come after this, or the reactor could take its reply while it polls.
+    readSource_->resume();
+    {
+      std::lock_guard<std::mutex> lock(mu_);
+      syncReader_ = false;
+    }
+    if (!sent.ok()) return sent.error();
+  } else if (Status sent = transmit(std::move(frame).value(), &pending); !sent.ok()) {
+    return sent.error();
+  }
+  waiter->signal.wait();
+  return std::move(*waiter->outcome);
+}
+
+void Connection::readUntilDone(const SyncWaiter& waiter, int fd) {
+  // Waits out a delivery that was already running when the reactor was told
+  // to stop: it may have taken the reply, or be about to.
+  queue_->sync([] {});
+  for (;;) {
+    if (waiter.done.load(std::memory_order_acquire)) return;
+    {
+      dispatch::ScopedBlockingCall blocking;
+      pollfd ready{fd, POLLIN, 0};
+      // invalidate() shuts the socket down, which ends this wait too.
+      while (::poll(&ready, 1, -1) < 0 && errno == EINTR) {
+      }
+    }
+    // On the delivery queue (inline when it is idle), so that every event
+    // keeps its place in the connection's order.
+    queue_->sync([this, &waiter] {
+      if (!waiter.done.load(std::memory_order_acquire)) onReadable();
+    });
+  }
+}
+
+void Connection::sendGoodbye() {
+  Result<std::vector<std::uint8_t>> frame = encodeFrame(FrameKind::Goodbye, 0, Value());
+  if (frame.ok()) (void)transmit(std::move(frame).value(), nullptr);
+}
+
+void Connection::sendReply(std::uint64_t requestId, Value body) {
+  Result<std::vector<std::uint8_t>> frame = encodeFrame(FrameKind::Reply, requestId, body);
+  if (!frame.ok()) {
+    mbxLog().error("%{public}s: reply to request %llu not sent: %@", description(),
+                   ull(requestId), frame.error());
+    return;
+  }
+  if (Status sent = transmit(std::move(frame).value(), nullptr); !sent.ok()) {
+    mbxLog().debug("%{public}s: reply to request %llu dropped: %@", description(),
+                   ull(requestId), sent.error());
+  }
+}
+
+Status Connection::transmit(std::vector<std::uint8_t> frame, PendingReply* pending) {
+  std::lock_guard<std::mutex> lock(mu_);
+  if (state_ == State::Invalid || closing_) return makeError(ErrorCode::ConnectionInvalid);
+  if (pending != nullptr && pending_.size() >= limits_.maxPendingReplies) {
+    return makeError(ErrorCode::TooManyPendingReplies,
+                     std::to_string(pending_.size()) + " awaited on " + description());
+  }
+  // Ids are stamped under the lock that orders the writes, so they increase
+  // on the wire whichever threads send.
+  const std::uint64_t id = ++lastSentId_;
+  setMessageId(frame, id);
+  if (pending != nullptr) pending_.add(id, std::move(*pending));
+  std::size_t written = 0;
+  if (output_.empty()) {
+    // Nothing queued ahead: write now, on the caller's thread.
+    for (;;) {
+      ssize_t n = ::send(fd_, frame.data(), frame.size(), MSG_NOSIGNAL | MSG_DONTWAIT);
+      if (n >= 0) {
+        written = static_cast<std::size_t>(n);
+        break;
+      }
+      const int err = errno;
+      if (err == EINTR) continue;
+      if (err == EAGAIN || err == EWOULDBLOCK) break;
+      mbxLog().info("%{public}s: closing: write failed: %{errno}d", description(), err);
+      closeLaterLocked();
+      return okStatus();  // a request learns of it as the connection's error
+    }
+    if (written == frame.size()) return okStatus();
+  }
+  output_.append(std::move(frame), written);
+  if (output_.bytes() > limits_.maxQueuedOutputBytes) {
+    mbxLog().error("%{public}s: closing: the peer does not read; %zu bytes queued, limit %zu",
+                   description(), output_.bytes(), limits_.maxQueuedOutputBytes);
+    closeLaterLocked();
+    return okStatus();
+  }
+  if (!writeSource_ && !makeWriteSourceLocked()) {
+    closeLaterLocked();
+    return okStatus();
+  }
+  if (!writeWatched_) {
+    writeWatched_ = true;
+    writeSource_->resume();
+  }
+  return okStatus();
+}
+
+bool Connection::makeWriteSourceLocked() {
+  // epoll watches a descriptor once, and the read source has this one; the
+  // write source gets a duplicate of its own. Only connections whose output
+  // ever backs up pay for it.
+  int duplicate = ::fcntl(fd_, F_DUPFD_CLOEXEC, 0);
+  if (duplicate < 0) {
+    const int err = errno;
+    mbxLog().error("%{public}s: closing: cannot wait for the socket to drain: %{errno}d",
+                   description(), err);
+    return false;
+  }
+  auto handle = std::make_shared<internal::SocketHandle>(duplicate);
+  auto source = dispatch::FdSource::create(
+      queue_->label() + " write", dispatch::Priority::Default, duplicate,
+      dispatch::FdSource::Event::Writable, queue_,
+      [weak = weak_from_this()] {
+        if (auto self = weak.lock()) self->onWritable();
+      });
+  if (!source) {
+    mbxLog().error("%{public}s: closing: cannot wait for the socket to drain: %{public}s",
+                   description(), source.message());
+    return false;
+  }
+  source.value()->setCancelHandler([handle] { (void)handle; });
+  writeSource_ = std::move(source).value();
+  return true;
+}
+
+void Connection::closeLaterLocked() {
+  if (closing_) return;
+  closing_ = true;
+  output_.clear();
+  queue_->async([self = shared_from_this()] { self->invalidate(); });
+}
+
+void Connection::onWritable() {
+  std::lock_guard<std::mutex> lock(mu_);
+  if (state_ == State::Invalid || closing_) return;
+  int err = 0;
+  switch (output_.flushTo(fd_, &err)) {
+    case internal::OutputQueue::Flush::Drained:
+      writeWatched_ = false;
+      writeSource_->suspend();
+      return;
+    case internal::OutputQueue::Flush::WouldBlock:
+      return;
+    case internal::OutputQueue::Flush::Failed:
+      mbxLog().info("%{public}s: closing: write failed: %{errno}d", description(), err);
+      closeLaterLocked();
+      return;
+  }
+}
+
+}  // namespace platform::mbx

@@ -1,0 +1,57 @@
+// A reply under construction, made from a request. Its body starts as an
+// empty dictionary; send() routes it to the connection the request came on,
+// answering the request's id. When that connection has gone, or the request
+// expected no reply, the reply is dropped harmlessly (logged at debug level):
+// a daemon answering a client that just exited is no error.
+//
+//   void handle(const mbx::Message& request) {
+//     auto reply = mbx::Reply::createReply(request);
+//     reply.body().set("status", 0);
+//     reply.send();
+//   }
+//
+// Thread safety: a plain value; build and send it from one thread at a time.
+// send() itself may be called from any queue.
+#pragma once
+
+#include <cstdint>
+#include <memory>
+
+#include "platform/mbx/KeepAliveTransaction.h"
+#include "platform/mbx/Message.h"
+#include "platform/values/Value.h"
+
+namespace platform::mbx {
+
+class Connection;
+
+class Reply {
+ public:
+  static Reply createReply(const Message& request);
+
+  Reply(Reply&&) noexcept = default;
+  Reply& operator=(Reply&&) noexcept = default;
+  Reply(const Reply&) = delete;
+  Reply& operator=(const Reply&) = delete;
+
+  platform::Dictionary& body() { return body_; }
+  std::uint64_t requestId() const { return requestId_; }
+
+  // Sends the body (moved out) once; later calls do nothing. Ends the
+  // request's keep-alive transaction as far as this reply is concerned.
+  void send();
+  bool sent() const { return sent_; }
+
+ private:
+  Reply(std::weak_ptr<Connection> connection, std::uint64_t requestId, bool expected,
+        std::shared_ptr<KeepAliveTransaction> transaction);
+
+  std::weak_ptr<Connection> connection_;
+  std::uint64_t requestId_;
+  bool expected_;
+  bool sent_ = false;
+  platform::Dictionary body_;
+  std::shared_ptr<KeepAliveTransaction> transaction_;
+};
+
+}  // namespace platform::mbx
