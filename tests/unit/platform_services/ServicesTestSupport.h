@@ -1,0 +1,83 @@
+// Helpers shared by the platform-service tests: a scratch directory that is
+// removed afterwards, and writing vmap documents and raw text into it.
+#pragma once
+
+#include <gtest/gtest.h>
+#include <limits.h>
+#include <stdlib.h>
+#include <sys/stat.h>
+
+#include <filesystem>
+#include <fstream>
+#include <string>
+
+#include "platform/values/Value.h"
+#include "platform/vmap/AtomicFile.h"
+#include "platform/vmap/Writer.h"
+
+namespace platform::services_testing {
+
+// A fresh directory under the temporary directory, with its canonical path
+// (so that tests can compare against realpath results).
+class ScratchDirectory {
+ public:
+  ScratchDirectory() {
+    std::string pattern = (std::filesystem::temp_directory_path() / "qv-services-XXXXXX").string();
+    char* made = ::mkdtemp(pattern.data());
+    EXPECT_NE(made, nullptr);
+    char resolved[PATH_MAX];
+    path_ = ::realpath(pattern.c_str(), resolved) != nullptr ? resolved : pattern;
+  }
+  ~ScratchDirectory() {
+    std::error_code ignored;
+    std::filesystem::remove_all(path_, ignored);
+  }
+  ScratchDirectory(const ScratchDirectory&) = delete;
+  ScratchDirectory& operator=(const ScratchDirectory&) = delete;
+
+  const std::string& path() const { return path_; }
+  std::string operator/(const std::string& relative) const { return path_ + "/" + relative; }
+
+ private:
+  std::string path_;
+};
+
+inline void makeDirectories(const std::string& path) {
+  std::filesystem::create_directories(path);
+}
+
+// Writes `value` as an XML vmap document (mode 0644), making the directory.
+inline void writeVmap(const std::string& path, const Value& value) {
+  makeDirectories(std::filesystem::path(path).parent_path().string());
+  Status written = vmap::writeFileAtomically(path, value, vmap::Format::Xml);
+  ASSERT_TRUE(written.ok()) << written.error().description();
+}
+
+// Writes `text` in place: an existing file keeps its inode.
+inline void writeText(const std::string& path, const std::string& text) {
+  makeDirectories(std::filesystem::path(path).parent_path().string());
+  std::ofstream out(path, std::ios::binary | std::ios::trunc);
+  out << text;
+  ASSERT_TRUE(out.good()) << path;
+}
+
+// The XML text of `value`, to write in place with writeText.
+inline std::string vmapText(const Value& value) {
+  Result<std::string> text = vmap::write(value, vmap::Format::Xml);
+  EXPECT_TRUE(text.ok());
+  return text.ok() ? *text : std::string();
+}
+
+inline ino_t inodeOf(const std::string& path) {
+  struct stat status {};
+  EXPECT_EQ(::stat(path.c_str(), &status), 0) << path;
+  return status.st_ino;
+}
+
+inline mode_t modeOf(const std::string& path) {
+  struct stat status {};
+  EXPECT_EQ(::lstat(path.c_str(), &status), 0) << path;
+  return status.st_mode & 07777;
+}
+
+}  // namespace platform::services_testing
