@@ -1,4 +1,4 @@
-// Parsing of one conversion specification ("%-08.3{public}..." etc.) out of a
+// Parsing of one conversion ("%-08.3{public}..." etc.) out of a
 // format string.
 //
 // Thread safety: pure functions; safe from any thread.
