@@ -84,25 +84,15 @@ class RandomValues {
   std::string text() {
     static constexpr std::uint32_t kRanges[][2] = {
         {0x20, 0x7e}, {0x80, 0x7ff}, {0x800, 0xd7ff}, {0xe000, 0xffff}, {0x10000, 0x10ffff}};
+    constexpr std::uint8_t kLead[] = {0x00, 0xC0, 0xE0, 0xF0};
     std::string out;
     for (std::size_t n = pick(12); n > 0; --n) {
       const auto& range = kRanges[pick(std::size(kRanges))];
       std::uint32_t cp = range[0] + static_cast<std::uint32_t>(pick(range[1] - range[0] + 1));
-      if (cp < 0x80) {
-        out.push_back(static_cast<char>(cp));
-      } else if (cp < 0x800) {
-        out.push_back(static_cast<char>(0xC0 | (cp >> 6)));
-        out.push_back(static_cast<char>(0x80 | (cp & 0x3F)));
-      } else if (cp < 0x10000) {
-        out.push_back(static_cast<char>(0xE0 | (cp >> 12)));
-        out.push_back(static_cast<char>(0x80 | ((cp >> 6) & 0x3F)));
-        out.push_back(static_cast<char>(0x80 | (cp & 0x3F)));
-      } else {
-        out.push_back(static_cast<char>(0xF0 | (cp >> 18)));
-        out.push_back(static_cast<char>(0x80 | ((cp >> 12) & 0x3F)));
-        out.push_back(static_cast<char>(0x80 | ((cp >> 6) & 0x3F)));
-        out.push_back(static_cast<char>(0x80 | (cp & 0x3F)));
-      }
+      const int extra = cp < 0x80 ? 0 : cp < 0x800 ? 1 : cp < 0x10000 ? 2 : 3;
+      out.push_back(static_cast<char>(kLead[extra] | (cp >> (6 * extra))));
+      for (int i = extra - 1; i >= 0; --i)
+        out.push_back(static_cast<char>(0x80 | ((cp >> (6 * i)) & 0x3F)));
     }
     return out;
   }
@@ -110,30 +100,24 @@ class RandomValues {
   std::mt19937_64 rng_;
 };
 
-constexpr int kValues = 400;
+constexpr int kValues = 800;
 
-TEST(CborDifferential, LibcborReadsOurEncodingsAsTheSameStructure) {
+// Each value both ways: libcbor reads our bytes as the same structure, and we
+// read libcbor's writing of it, in several widths, as the same Value.
+TEST(CborDifferential, AgreesWithLibcborBothWays) {
   RandomValues random(20240611);
   for (int i = 0; i < kValues; ++i) {
     Value value = random.next();
-    auto bytes = encode(value);
-    ASSERT_TRUE(bytes.ok()) << bytes.error().description();
-    auto item = oracle::libcborLoad(*bytes);
-    ASSERT_TRUE(item) << "libcbor refused " << toHex(*bytes);
-    auto mismatch = oracle::itemMismatch(*item, value);
-    EXPECT_FALSE(mismatch) << *mismatch << " in " << toHex(*bytes);
-  }
-}
-
-TEST(CborDifferential, WeReadLibcborEncodingsOfEveryWidth) {
-  RandomValues random(77);
-  for (int i = 0; i < kValues; ++i) {
-    Value value = random.next();
+    auto ours = encode(value);
+    ASSERT_TRUE(ours.ok()) << ours.error().description();
+    auto loaded = oracle::libcborLoad(*ours);
+    ASSERT_TRUE(loaded) << "libcbor refused " << toHex(*ours);
+    auto mismatch = oracle::itemMismatch(*loaded, value);
+    EXPECT_FALSE(mismatch) << *mismatch << " in " << toHex(*ours);
     for (ItemWidths widths : {ItemWidths::kShortest, ItemWidths::kNarrowest, ItemWidths::kWidest}) {
       auto item = oracle::itemFromValue(value, widths);
       ASSERT_TRUE(item);
       std::vector<std::uint8_t> theirs = oracle::libcborSerialize(*item);
-      ASSERT_FALSE(theirs.empty());
       auto back = decode(theirs);
       ASSERT_TRUE(back.ok()) << back.error().description() << " in " << toHex(theirs);
       auto difference = oracle::firstDifference(value, *back);
@@ -141,21 +125,9 @@ TEST(CborDifferential, WeReadLibcborEncodingsOfEveryWidth) {
       // In the codec's own form an independent writer agrees byte for byte,
       // which pins every head we write to the shortest one.
       if (widths == ItemWidths::kShortest) {
-        EXPECT_EQ(toHex(*encode(value)), toHex(theirs));
+        EXPECT_EQ(toHex(*ours), toHex(theirs));
       }
     }
-  }
-}
-
-TEST(CborDifferential, WeReadLibcborHalfFloats) {
-  for (float f : {0.5f, -2.0f, 65504.0f, 0.00006103515625f, 5.9604644775390625e-8f,
-                  std::numeric_limits<float>::infinity()}) {
-    oracle::ItemPtr item(cbor_build_float2(f));
-    std::vector<std::uint8_t> bytes = oracle::libcborSerialize(*item);
-    ASSERT_EQ(bytes.size(), 3u);
-    auto v = decode(bytes);
-    ASSERT_TRUE(v.ok());
-    EXPECT_EQ(*v->real(), static_cast<double>(f)) << toHex(bytes);
   }
 }
 

@@ -23,11 +23,7 @@ TEST(LogFilter, GlobalThreshold) {
   EXPECT_EQ(parsedCleanly("").thresholdFor(kDaemon, "ops"), Threshold::Default);
   EXPECT_EQ(parsedCleanly("info").thresholdFor(kDaemon, "ops"), Threshold::Info);
   EXPECT_EQ(parsedCleanly("Info").thresholdFor("", ""), Threshold::Info);
-  EXPECT_EQ(parsedCleanly("OFF").thresholdFor(kDaemon, "hv"), Threshold::Off);
   EXPECT_EQ(parsedCleanly("debug, error ,,").globalThreshold(), Threshold::Error);
-  EXPECT_FALSE(admits(Threshold::Off, Level::Fault));
-  EXPECT_FALSE(admits(Threshold::Default, Level::Info));
-  EXPECT_TRUE(admits(Threshold::Default, Level::Default));
 }
 
 TEST(LogFilter, PerCategoryAndPerLogger) {

@@ -10,6 +10,7 @@
 #include <stdexcept>
 #include <string>
 
+#include "LogTestSupport.h"
 #include "platform/values/Error.h"
 #include "platform/values/Value.h"
 
@@ -26,14 +27,7 @@ std::string redacted(std::string_view format, const Args&... args) {
   return formatMessage(Redaction::On, format, args...);
 }
 
-// Counts how often it is described, to prove when formatting happens.
-struct Counted {
-  mutable int calls = 0;
-  std::string description() const {
-    ++calls;
-    return "counted";
-  }
-};
+using testing::Counted;
 
 enum class Color : std::uint8_t { Red = 1, Green = 2 };
 
@@ -139,9 +133,9 @@ TEST(LogFormat, RedactionHidesStringsAndObjectsUnlessPublic) {
   // A redacted object is never described: its text is not needed.
   Counted counted;
   EXPECT_EQ(redacted("%@", counted), "<private>");
-  EXPECT_EQ(counted.calls, 0);
+  EXPECT_EQ(counted.calls.load(), 0);
   EXPECT_EQ(redacted("%{public}@", counted), "counted");
-  EXPECT_EQ(counted.calls, 1);
+  EXPECT_EQ(counted.calls.load(), 1);
 }
 
 TEST(LogFormat, LongMessagesAreCutWithAMarker) {

@@ -1,11 +1,13 @@
-// Helpers shared by the log tests: a temporary file to send lines to, and a
-// fixture that puts the log layer back in its default state around a test.
+// Helpers shared by the log tests: a temporary file to send lines to, an
+// argument that counts its descriptions, and a fixture that puts the log
+// layer back in its default state around a test.
 #pragma once
 
 #include <gtest/gtest.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <atomic>
 #include <cstdio>
 #include <cstdlib>
 #include <sstream>
@@ -48,6 +50,15 @@ class TempFile {
 
  private:
   std::FILE* file_;
+};
+
+// Counts how often it is described, to prove when formatting happens.
+struct Counted {
+  mutable std::atomic<int> calls{0};
+  std::string description() const {
+    ++calls;
+    return "counted";
+  }
 };
 
 // Resets filter, environment and output around each test.

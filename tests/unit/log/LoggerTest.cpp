@@ -19,15 +19,8 @@ namespace {
 
 constexpr std::string_view kDaemon = "com.corvane.Quorvex";
 
-struct Counted {
-  mutable std::atomic<int> calls{0};
-  std::string description() const {
-    ++calls;
-    return "counted";
-  }
-};
-
 using LogLogger = testing::LogTest;
+using testing::Counted;
 
 TEST_F(LogLogger, NamesAreCheckedAndEachPairHasOneLogger) {
   const std::pair<std::string, LoggerError> bad[] = {
@@ -55,24 +48,7 @@ TEST_F(LogLogger, NamesAreCheckedAndEachPairHasOneLogger) {
   EXPECT_EQ(ops.category(), "ops");
 }
 
-TEST_F(LogLogger, LevelsAndDefaultThreshold) {
-  const Logger& l = logger(kDaemon, "ops");
-  LogCaptureForTesting capture;
-  l.debug("d");
-  l.info("i");
-  l.notice("n %d", 1);
-  l.error("e");
-  l.log(Level::Fault, "f");
-  std::vector<CapturedLine> lines = capture.lines();
-  ASSERT_EQ(lines.size(), 3u);
-  EXPECT_EQ(lines[0].level, Level::Default);
-  EXPECT_EQ(lines[0].message, "n 1");
-  EXPECT_EQ(lines[0].subsystem, kDaemon);
-  EXPECT_EQ(lines[0].category, "ops");
-  EXPECT_EQ(lines[1].level, Level::Error);
-  EXPECT_EQ(lines[2].level, Level::Fault);
-}
-
+// Below the threshold nothing is formatted: the argument is never described.
 TEST_F(LogLogger, DisabledLevelBuildsNoMessage) {
   const Logger& l = logger(kDaemon, "hv");
   Counted counted;
@@ -80,7 +56,9 @@ TEST_F(LogLogger, DisabledLevelBuildsNoMessage) {
   l.debug("%{public}@", counted);
   l.info("%{public}@ %{public}@", counted, counted);
   EXPECT_EQ(counted.calls.load(), 0);
-  l.notice("%{public}@", counted);
+  l.notice("n %{public}@", counted);
+  l.error("e");
+  l.log(Level::Fault, "f");
   EXPECT_EQ(counted.calls.load(), 1);
   LoggerRegistry::shared().applyFilterForTesting("hv=debug");
   l.debug("%{public}@", counted);
@@ -88,7 +66,15 @@ TEST_F(LogLogger, DisabledLevelBuildsNoMessage) {
   LoggerRegistry::shared().applyFilterForTesting("hv=off");
   l.fault("%{public}@", counted);
   EXPECT_EQ(counted.calls.load(), 2);
-  EXPECT_EQ(capture.size(), 2u);
+  std::vector<CapturedLine> lines = capture.lines();
+  ASSERT_EQ(lines.size(), 4u);
+  EXPECT_EQ(lines[0].level, Level::Default);
+  EXPECT_EQ(lines[0].message, "n counted");
+  EXPECT_EQ(lines[0].subsystem, kDaemon);
+  EXPECT_EQ(lines[0].category, "hv");
+  EXPECT_EQ(lines[1].level, Level::Error);
+  EXPECT_EQ(lines[2].level, Level::Fault);
+  EXPECT_EQ(lines[3].level, Level::Debug);
 }
 
 TEST_F(LogLogger, LinesAreRedactedUnlessQvLogPrivateIsOne) {

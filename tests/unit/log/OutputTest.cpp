@@ -59,11 +59,18 @@ TEST(LogLine, JournalStreamMustNameTheDescriptor) {
 
 using LogOutput = testing::LogTest;
 
+// Client text is escaped on the way out, so it cannot forge a line of its
+// own; the capture still sees it as it was.
 TEST_F(LogOutput, WritesJournalFormWhenStderrIsTheJournal) {
   testing::TempFile file;
   internal::Output::shared().setDescriptorForTesting(file.fd());
   const Logger& l = logger("com.corvane.Quorvex", "ops");
-  l.error("plain");
+  const std::string forged = "ok\n2021-03-04T05:06:07.000000Z qvd[1:1] <Fault> [x:y] pwned\r";
+  {
+    LogCaptureForTesting capture(CaptureEcho::AlsoStderr);
+    l.error("plain %{public}s", forged);
+    EXPECT_EQ(capture.messages(), std::vector<std::string>{"plain " + forged});
+  }
   setenv("JOURNAL_STREAM", file.journalStreamValue().c_str(), 1);
   LoggerRegistry::shared().reloadEnvironmentForTesting();
   l.fault("journal");
@@ -76,27 +83,16 @@ TEST_F(LogOutput, WritesJournalFormWhenStderrIsTheJournal) {
   std::vector<std::string> lines = file.lines();
   ASSERT_EQ(lines.size(), 4u);
   EXPECT_EQ(lines[0].rfind("20", 0), 0u) << lines[0];
-  EXPECT_NE(lines[0].find(" <Error> [com.corvane.Quorvex:ops] plain"), std::string::npos);
+  EXPECT_NE(
+      lines[0].find(" <Error> [com.corvane.Quorvex:ops] plain ok\\n2021-03-04T05:06:07.000000Z "
+                    "qvd[1:1] <Fault> [x:y] pwned\\r"),
+      std::string::npos)
+      << lines[0];
   EXPECT_EQ(lines[1].rfind("<2>", 0), 0u) << lines[1];
   EXPECT_NE(lines[1].find("] <Fault> [com.corvane.Quorvex:ops] journal"), std::string::npos);
   EXPECT_EQ(lines[2].rfind("<5>", 0), 0u) << lines[2];
   EXPECT_NE(lines[2].find("] <Default> default"), std::string::npos);
   EXPECT_EQ(lines[3].rfind("20", 0), 0u) << lines[3];
-}
-
-TEST_F(LogOutput, ClientTextCannotForgeALine) {
-  testing::TempFile file;
-  internal::Output::shared().setDescriptorForTesting(file.fd());
-  LogCaptureForTesting capture(CaptureEcho::AlsoStderr);
-  std::string forged = "ok\n2021-03-04T05:06:07.000000Z qvd[1:1] <Fault> [x:y] pwned\r";
-  logger("com.corvane.Quorvex", "extension").error("client said %{public}s", forged);
-  std::vector<std::string> lines = file.lines();
-  ASSERT_EQ(lines.size(), 1u);
-  EXPECT_NE(lines[0].find("client said ok\\n2021-03-04T05:06:07.000000Z qvd[1:1] <Fault> "
-                          "[x:y] pwned\\r"),
-            std::string::npos)
-      << lines[0];
-  EXPECT_EQ(capture.messages(), std::vector<std::string>{"client said " + forged});
 }
 
 }  // namespace
