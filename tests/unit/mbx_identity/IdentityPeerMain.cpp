@@ -9,7 +9,6 @@
 #include <linux/filter.h>
 #include <linux/seccomp.h>
 #include <sched.h>
-#include <stddef.h>
 #include <string.h>
 #include <sys/prctl.h>
 #include <sys/socket.h>
@@ -21,25 +20,21 @@
 
 namespace {
 
-bool applySeccompAllowAll() {
-  struct sock_filter allow = BPF_STMT(BPF_RET | BPF_K, SECCOMP_RET_ALLOW);
-  struct sock_fprog program {};
-  program.len = 1;
-  program.filter = &allow;
-  return ::prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0) == 0 &&
-         ::syscall(SYS_seccomp, SECCOMP_SET_MODE_FILTER, 0, &program) == 0;
-}
-
 char confine(const std::string& mode, const char* name) {
   if (mode == "plain") return 'R';
-  if (mode == "nnp") return ::prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0) == 0 ? 'R' : 'F';
-  if (mode == "seccomp") return applySeccompAllowAll() ? 'R' : 'F';
+  if (mode == "nnp" || mode == "seccomp") {
+    if (::prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0) != 0) return 'F';
+    struct sock_filter allow = BPF_STMT(BPF_RET | BPF_K, SECCOMP_RET_ALLOW);
+    struct sock_fprog program = {1, &allow};  // a filter that allows everything
+    return mode == "nnp" || ::syscall(SYS_seccomp, SECCOMP_SET_MODE_FILTER, 0, &program) == 0
+               ? 'R'
+               : 'F';
+  }
   if (mode == "mntns") {
     if (::unshare(CLONE_NEWNS) == 0) return 'R';
     return errno == EPERM || errno == EINVAL ? 'S' : 'F';
   }
-  if (mode == "name" && name != nullptr)
-    return ::prctl(PR_SET_NAME, name, 0, 0, 0) == 0 ? 'R' : 'F';
+  if (mode == "name" && name != nullptr) return ::prctl(PR_SET_NAME, name, 0, 0, 0) == 0 ? 'R' : 'F';
   return 'F';
 }
 
@@ -54,16 +49,14 @@ int main(int argc, char** argv) {
   if (fd < 0 || ::strlen(argv[1]) >= sizeof address.sun_path) return 2;
   ::strcpy(address.sun_path, argv[1]);
   if (::connect(fd, reinterpret_cast<sockaddr*>(&address), sizeof address) != 0) return 2;
-
   const char reply = confine(argv[3], argc > 4 ? argv[4] : nullptr);
   if (::write(fd, &reply, 1) != 1) return 2;
-  for (;;) {
-    char command = 0;
-    if (::read(fd, &command, 1) != 1 || command == 'q') return 0;
+  for (char command = 0; ::read(fd, &command, 1) == 1 && command != 'q';) {
     if (command == 'e') {
       const std::string fdText = std::to_string(fd);
       ::execl(argv[2], argv[2], fdText.c_str(), static_cast<char*>(nullptr));
       return 3;
     }
   }
+  return 0;
 }

@@ -20,82 +20,64 @@ using testing::kPeerProgram;
 using testing::PeerProcess;
 using Reap = PeerProcess::Reap;
 
-class PeerIdentityLifetimeTest : public ::testing::TestWithParam<PidfdSource> {
- protected:
-  void SetUp() override {
-    peer_ = PeerProcess::start(kPeerProgram, "plain");
-    ASSERT_NE(peer_, nullptr);
-    hooks_.pidfdSource = GetParam();
-  }
+class PeerIdentityLifetimeTest : public ::testing::TestWithParam<PidfdSource> {};
 
-  Result<std::shared_ptr<const PeerIdentity>> take() {
-    return PeerIdentity::fromSocketForTesting(peer_->connection(), hooks_);
-  }
-
-  void expectError(const Result<std::shared_ptr<const PeerIdentity>>& taken,
-                   IdentityErrorCode code) {
-    ASSERT_FALSE(taken.ok()) << (*taken)->description();
-    EXPECT_TRUE(isIdentityError(taken.error(), code))
-        << "wanted " << identityErrorCodeName(code) << ", got " << taken.error().description();
-  }
-
-  std::unique_ptr<PeerProcess> peer_;
-  IdentityTestHooks hooks_;
-};
-
-TEST_P(PeerIdentityLifetimeTest, TakesTheIdentityOfALivePeer) {
-  auto taken = take();
+TEST_P(PeerIdentityLifetimeTest, IsAliveUntilThePeerExits) {
+  std::unique_ptr<PeerProcess> peer = PeerProcess::start(kPeerProgram, "plain");
+  ASSERT_NE(peer, nullptr);
+  IdentityTestHooks hooks;
+  hooks.pidfdSource = GetParam();
+  auto taken = PeerIdentity::fromSocketForTesting(peer->connection(), hooks);
   ASSERT_TRUE(taken.ok()) << taken.error().description();
-  EXPECT_EQ((*taken)->pid(), peer_->pid());
+  EXPECT_EQ((*taken)->pid(), peer->pid());
   EXPECT_TRUE((*taken)->isAlive());
-}
-
-TEST_P(PeerIdentityLifetimeTest, PeerReapedBeforehandIsAnError) {
-  ASSERT_TRUE(peer_->quit(Reap::Yes));
-  auto taken = take();
-  expectError(taken, IdentityErrorCode::PeerExited);
-  if (!taken.ok()) {
-    EXPECT_EQ(taken.error().description(),
-              "peer " + std::to_string(peer_->pid()) + " exited before its identity was taken");
-  }
-}
-
-TEST_P(PeerIdentityLifetimeTest, ZombiePeerIsAnError) {
-  ASSERT_TRUE(peer_->quit(Reap::No));
-  expectError(take(), IdentityErrorCode::PeerExited);
-}
-
-TEST_P(PeerIdentityLifetimeTest, IsAliveTurnsFalseWhenThePeerExits) {
-  auto taken = take();
-  ASSERT_TRUE(taken.ok()) << taken.error().description();
-  ASSERT_TRUE((*taken)->isAlive());
-  ASSERT_TRUE(peer_->quit(Reap::No));
+  ASSERT_TRUE(peer->quit(Reap::No));
   EXPECT_FALSE((*taken)->isAlive());
-  ASSERT_TRUE(peer_->quit(Reap::Yes));
+  ASSERT_TRUE(peer->quit(Reap::Yes));
   EXPECT_FALSE((*taken)->isAlive());
 }
 
-TEST_P(PeerIdentityLifetimeTest, PeerThatExitsDuringTheReadsIsAnError) {
-  hooks_.betweenReads = [this](pid_t) { ASSERT_TRUE(peer_->quit(Reap::Yes)); };
-  expectError(take(), IdentityErrorCode::PeerExited);
-}
-
-TEST_P(PeerIdentityLifetimeTest, PeerThatExecsDuringTheReadsIsAnError) {
-  hooks_.betweenReads = [this](pid_t) { ASSERT_TRUE(peer_->execTarget()); };
-  expectError(take(), IdentityErrorCode::ExecutableChanged);
-}
-
-TEST_P(PeerIdentityLifetimeTest, StartTimeChangedBetweenReadsIsAnError) {
-  // As if the pid had passed to a new process between the two reads.
-  hooks_.startTime = [](StartTimeRead read, std::uint64_t t) {
-    return read == StartTimeRead::Second ? t + 1 : t;
+TEST_P(PeerIdentityLifetimeTest, PeerThatIsGoneOrChangesIsAnError) {
+  // What the peer is made to do before the identity is taken ('q' exit and be
+  // reaped, 'z' exit as a zombie) or between its reads ('q', or 'e' exec),
+  // and what the hook adds to the first and second start time read.
+  const struct {
+    const char* what;
+    char before, between;
+    std::uint64_t first, second;
+    IdentityErrorCode code;
+  } cases[] = {
+      {"reaped beforehand", 'q', 0, 0, 0, IdentityErrorCode::PeerExited},
+      {"zombie", 'z', 0, 0, 0, IdentityErrorCode::PeerExited},
+      {"exits during the reads", 0, 'q', 0, 0, IdentityErrorCode::PeerExited},
+      {"execs during the reads", 0, 'e', 0, 0, IdentityErrorCode::ExecutableChanged},
+      // As if the pid had passed to a new process between the two reads.
+      {"start time moved between reads", 0, 0, 0, 1, IdentityErrorCode::StartTimeMismatch},
+      {"started after the accept", 0, 0, 1'000'000, 1'000'000, IdentityErrorCode::PidReused},
   };
-  expectError(take(), IdentityErrorCode::StartTimeMismatch);
-}
-
-TEST_P(PeerIdentityLifetimeTest, ProcessStartedAfterTheAcceptIsPidReuse) {
-  hooks_.startTime = [](StartTimeRead, std::uint64_t t) { return t + 1'000'000; };
-  expectError(take(), IdentityErrorCode::PidReused);
+  const auto act = [](PeerProcess& peer, char what) {
+    return what == 'e' ? peer.execTarget() : peer.quit(what == 'z' ? Reap::No : Reap::Yes);
+  };
+  for (const auto& c : cases) {
+    std::unique_ptr<PeerProcess> peer = PeerProcess::start(kPeerProgram, "plain");
+    ASSERT_NE(peer, nullptr);
+    IdentityTestHooks hooks;
+    hooks.pidfdSource = GetParam();
+    ASSERT_TRUE(c.before == 0 || act(*peer, c.before)) << c.what;
+    if (c.between != 0) hooks.betweenReads = [&](pid_t) { ASSERT_TRUE(act(*peer, c.between)); };
+    hooks.startTime = [&c](StartTimeRead read, std::uint64_t t) {
+      return t + (read == StartTimeRead::First ? c.first : c.second);
+    };
+    auto taken = PeerIdentity::fromSocketForTesting(peer->connection(), hooks);
+    ASSERT_FALSE(taken.ok()) << c.what << ": " << (*taken)->description();
+    EXPECT_TRUE(isIdentityError(taken.error(), c.code))
+        << c.what << ": wanted " << identityErrorCodeName(c.code) << ", got "
+        << taken.error().description();
+    if (c.code == IdentityErrorCode::PeerExited) {
+      EXPECT_EQ(taken.error().description(),
+                "peer " + std::to_string(peer->pid()) + " exited before its identity was taken");
+    }
+  }
 }
 
 // Identities are shared between the connection's queues: reading one from
@@ -106,7 +88,6 @@ TEST(PeerIdentitySharingTest, ManyThreadsReadOneIdentityWhileThePeerExits) {
   auto taken = PeerIdentity::fromSocket(peer->connection());
   ASSERT_TRUE(taken.ok()) << taken.error().description();
   const std::shared_ptr<const PeerIdentity> shared = *taken;
-
   std::atomic<bool> sawExit[4] = {};
   std::vector<std::thread> readers;
   for (std::atomic<bool>& saw : sawExit) {

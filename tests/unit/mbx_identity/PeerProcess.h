@@ -5,12 +5,26 @@
 // Thread safety: use from one thread.
 #pragma once
 
-#include <sys/types.h>
+#include <gtest/gtest.h>
+#include <poll.h>
+#include <signal.h>
+#include <spawn.h>
+#include <stdlib.h>
+#include <sys/socket.h>
+#include <sys/un.h>
+#include <sys/wait.h>
+#include <unistd.h>
 
+#include <cerrno>
+#include <cstring>
+#include <filesystem>
 #include <memory>
 #include <string>
+#include <vector>
 
 #include "platform/mbx/identity/internal/UniqueFd.h"
+
+extern char** environ;
 
 namespace platform::mbx::testing {
 
@@ -21,10 +35,15 @@ inline constexpr const char* kExecTargetProgram = EXEC_TARGET_PATH;
 // A fresh directory under /tmp, removed with everything in it.
 class TempDir {
  public:
-  TempDir();
-  ~TempDir();
-  TempDir(const TempDir&) = delete;
-  TempDir& operator=(const TempDir&) = delete;
+  TempDir() {
+    char pattern[] = "/tmp/qv-identity-XXXXXX";
+    EXPECT_NE(::mkdtemp(pattern), nullptr) << std::strerror(errno);
+    path_ = pattern;
+  }
+  ~TempDir() {
+    std::error_code ignored;
+    std::filesystem::remove_all(path_, ignored);
+  }
   const std::string& path() const { return path_; }
 
  private:
@@ -36,10 +55,41 @@ class PeerProcess {
   // Runs `program` with `mode` (see IdentityPeerMain.cpp) and `name`. Reports
   // a test failure and returns null when it does not connect and answer.
   static std::unique_ptr<PeerProcess> start(const std::string& program, const std::string& mode,
-                                            const std::string& name = "");
-  ~PeerProcess();
-  PeerProcess(const PeerProcess&) = delete;
-  PeerProcess& operator=(const PeerProcess&) = delete;
+                                            const std::string& name = "") {
+    std::unique_ptr<PeerProcess> peer(new PeerProcess());
+    std::vector<std::string> args = {program, peer->dir_.path() + "/socket", kExecTargetProgram,
+                                     mode};
+    if (!name.empty()) args.push_back(name);
+    internal::UniqueFd listener(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+    struct sockaddr_un address {};
+    address.sun_family = AF_UNIX;
+    std::strncpy(address.sun_path, args[1].c_str(), sizeof address.sun_path - 1);
+    std::vector<char*> argv;
+    for (std::string& arg : args) argv.push_back(arg.data());
+    argv.push_back(nullptr);
+    if (::bind(listener.get(), reinterpret_cast<sockaddr*>(&address), sizeof address) != 0 ||
+        ::listen(listener.get(), 1) != 0 ||
+        ::posix_spawn(&peer->pid_, program.c_str(), nullptr, nullptr, argv.data(), environ) != 0) {
+      peer->pid_ = -1;
+      ADD_FAILURE() << "cannot start " << program;
+      return nullptr;
+    }
+    if (waitReadable(listener.get())) {
+      peer->connection_.reset(::accept4(listener.get(), nullptr, nullptr, SOCK_CLOEXEC));
+    }
+    if (!peer->readByte(&peer->reply_)) {
+      ADD_FAILURE() << program << " did not connect and answer";
+      return nullptr;
+    }
+    return peer;
+  }
+  ~PeerProcess() {
+    connection_.reset();
+    if (pid_ > 0 && !reaped_) {
+      ::kill(pid_, SIGKILL);
+      ::waitpid(pid_, nullptr, 0);
+    }
+  }
 
   pid_t pid() const { return pid_; }
   // The daemon's end of the connection: what fromSocket is given.
@@ -49,17 +99,30 @@ class PeerProcess {
 
   // Makes the peer run the exec target, keeping the connection; true once
   // the target has answered.
-  bool execTarget();
+  bool execTarget() {
+    char answer = 0;
+    return ::send(connection(), "e", 1, MSG_NOSIGNAL) == 1 && readByte(&answer) && answer == 'X';
+  }
 
-  enum class Reap { Yes, No };
   // Makes the peer exit and waits until it has; with Reap::No it stays a
   // zombie until quit(Reap::Yes).
-  bool quit(Reap reap);
+  enum class Reap { Yes, No };
+  bool quit(Reap reap) {
+    // A peer that already exited (a zombie) has nothing left to tell.
+    if (::send(connection(), "q", 1, MSG_NOSIGNAL) != 1 && errno != EPIPE) return false;
+    if (reap == Reap::Yes) return reaped_ = ::waitpid(pid_, nullptr, 0) == pid_;
+    siginfo_t info{};
+    return ::waitid(P_PID, static_cast<id_t>(pid_), &info, WEXITED | WNOWAIT) == 0;
+  }
 
  private:
-  PeerProcess() = default;
-  bool readByte(char* byte);
-  bool send(char command);
+  static bool waitReadable(int fd) {
+    struct pollfd entry = {fd, POLLIN, 0};
+    return ::poll(&entry, 1, 10'000) == 1;
+  }
+  bool readByte(char* byte) {
+    return waitReadable(connection()) && ::read(connection(), byte, 1) == 1;
+  }
 
   TempDir dir_;
   internal::UniqueFd connection_;

@@ -21,29 +21,19 @@ std::string statLine(const std::string& pid, const std::string& name, const std:
   return line + "\n";
 }
 
-TEST(PeerIdentityProcStatTest, ReadsPidNameStateAndStartTime) {
-  Result<ProcStat> stat = parseProcStat(statLine("4242", "qvd", "987654321"));
-  ASSERT_TRUE(stat.ok()) << stat.error().description();
-  EXPECT_EQ(stat->pid, 4242);
-  EXPECT_EQ(stat->command, "qvd");
-  EXPECT_EQ(stat->state, 'S');
-  EXPECT_EQ(stat->startTime, 987654321u);
-  // Without the final newline too.
-  std::string bare = statLine("1", "init", "5");
-  bare.pop_back();
-  ASSERT_TRUE(parseProcStat(bare).ok());
-  EXPECT_EQ(parseProcStat(bare)->startTime, 5u);
-}
-
 TEST(PeerIdentityProcStatTest, NamesCannotShiftTheFields) {
   for (const std::string name :
-       {"a b", "a) b", ")", "((", ") S 1 2 3 4", "x) Z 9 9 (y", "new\nline", "", " ) ) "}) {
-    Result<ProcStat> stat = parseProcStat(statLine("77", name, "123456"));
+       {"qvd", "a b", "a) b", ")", "((", ") S 1 2 3 4", "x) Z 9 9 (y", "new\nline", "", " ) ) "}) {
+    Result<ProcStat> stat = parseProcStat(statLine("4242", name, "987654321"));
     ASSERT_TRUE(stat.ok()) << name << ": " << stat.error().description();
+    EXPECT_EQ(stat->pid, 4242) << name;
     EXPECT_EQ(stat->command, name);
     EXPECT_EQ(stat->state, 'S') << name;
-    EXPECT_EQ(stat->startTime, 123456u) << name;
+    EXPECT_EQ(stat->startTime, 987654321u) << name;
   }
+  std::string bare = statLine("1", "init", "5");  // without the final newline too
+  bare.pop_back();
+  EXPECT_EQ(parseProcStat(bare).valueOr(ProcStat{}).startTime, 5u);
 }
 
 TEST(PeerIdentityProcStatTest, RefusesMalformedLines) {
@@ -70,16 +60,13 @@ TEST(PeerIdentityProcStatTest, RefusesMalformedLines) {
 }
 
 TEST(PeerIdentityProcStatTest, LimitsTheLineLength) {
-  std::string atLimit = statLine("77", "", "31");
-  atLimit = statLine("77", std::string(kProcStatLimit - atLimit.size(), 'n'), "31");
+  const std::size_t frame = statLine("77", "", "31").size();
+  const std::string atLimit = statLine("77", std::string(kProcStatLimit - frame, 'n'), "31");
   ASSERT_EQ(atLimit.size(), kProcStatLimit);
-  ASSERT_TRUE(parseProcStat(atLimit).ok());
-  EXPECT_EQ(parseProcStat(atLimit)->startTime, 31u);
-
-  const std::string overLimit = statLine("77", std::string(kProcStatLimit, 'n'), "31");
-  Result<ProcStat> stat = parseProcStat(overLimit);
-  ASSERT_FALSE(stat.ok());
-  EXPECT_TRUE(isIdentityError(stat.error(), IdentityErrorCode::TooLong));
+  EXPECT_EQ(parseProcStat(atLimit).valueOr(ProcStat{}).startTime, 31u);
+  Result<ProcStat> over = parseProcStat(statLine("77", std::string(kProcStatLimit, 'n'), "31"));
+  ASSERT_FALSE(over.ok());
+  EXPECT_TRUE(isIdentityError(over.error(), IdentityErrorCode::TooLong));
 }
 
 constexpr const char* kStatus =
@@ -124,9 +111,8 @@ TEST(PeerIdentityProcStatusTest, RefusesMissingRepeatedOrBadFacts) {
 
 TEST(PeerIdentityPidfdInfoTest, ReadsThePidLineOnly) {
   const std::string info = "pos:\t0\nflags:\t02000002\nmnt_id:\t15\nino:\t1057\n";
-  ASSERT_TRUE(parsePidfdInfo(info + "Pid:\t4242\nNSpid:\t4242\t1\n").ok());
-  EXPECT_EQ(*parsePidfdInfo(info + "Pid:\t4242\nNSpid:\t4242\t1\n"), 4242);
-  EXPECT_EQ(*parsePidfdInfo(info + "Pid:\t-1\nNSpid:\t-1\n"), -1);  // exited
+  EXPECT_EQ(parsePidfdInfo(info + "Pid:\t4242\nNSpid:\t4242\t1\n").valueOr(0), 4242);
+  EXPECT_EQ(parsePidfdInfo(info + "Pid:\t-1\nNSpid:\t-1\n").valueOr(0), -1);  // exited
   for (const std::string& bad : {info, info + "Pid:\t\n", info + "Pid:\t12x\n",
                                  info + "Pid:\t1\nPid:\t2\n", std::string("NSpid:\t7\n")}) {
     Result<pid_t> pid = parsePidfdInfo(bad);

@@ -5,6 +5,8 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <optional>
+
 #include "platform/bundle/Bundle.h"
 #include "platform/bundle/BundleError.h"
 #include "platform/vmap/VmapError.h"
@@ -13,7 +15,6 @@
 namespace platform::bundle {
 namespace {
 
-using services_testing::ScratchDirectory;
 using services_testing::writeText;
 using services_testing::writeVmap;
 
@@ -31,45 +32,56 @@ class PlatformBundleTest : public ::testing::Test {
  protected:
   // An application X.app with executable X and a tool in a subdirectory.
   void SetUp() override {
-    app_ = scratch_ / "Applications/X.app";
     writeVmap(app_ + "/Info.vmap", Dictionary{{"BXExecutable", "X"}});
     writeText(app_ + "/X", "binary");
     writeText(app_ + "/bin/tool", "binary");
   }
-  ScratchDirectory scratch_;
-  std::string app_;
+  services_testing::ScratchDirectory scratch_;
+  const std::string app_ = scratch_ / "Applications/X.app";
 };
 
-TEST_F(PlatformBundleTest, ExecutableInsideAnApplication) {
-  for (const std::string& executable : {app_ + "/X", app_ + "/bin/tool"}) {
-    Bundle bundle = make(executable, BundlePathKind::Executable);
-    EXPECT_EQ(bundle.property(kBundlePath), Value(app_)) << executable;
-    EXPECT_EQ(bundle.property(kExecutablePath), Value(app_ + "/X")) << executable;
-    EXPECT_EQ(bundle.property(kSupportFilesPath), Value(app_)) << executable;
-    EXPECT_TRUE(bundle.isApplication());
-    EXPECT_FALSE(bundle.isPlugIn());
-    ASSERT_NE(bundle.infoDictionary(), nullptr);
-    EXPECT_FALSE(bundle.containingApplication().has_value());
+TEST_F(PlatformBundleTest, PathsOfBothKindsFindTheApplicationCanonically) {
+  ASSERT_EQ(::symlink(app_.c_str(), (scratch_ / "Link.app").c_str()), 0);
+  ASSERT_EQ(::symlink((app_ + "/X").c_str(), (scratch_ / "x-link").c_str()), 0);
+  const auto kExe = BundlePathKind::Executable;
+  const auto kDir = BundlePathKind::Directory;
+  const struct {
+    std::string path;
+    BundlePathKind kind;
+    bool found;
+  } cases[] = {
+      {app_ + "/X", kExe, true},
+      {app_ + "/bin/tool", kExe, true},
+      {app_ + "/bin", kExe, true},       // a directory inside, given as an executable
+      {app_ + "/bin/gone", kExe, true},  // missing, but its directory exists
+      {scratch_ / "x-link", kExe, true},
+      {scratch_ / "Link.app/", kDir, true},
+      {scratch_ / "Applications/./X.app//", kDir, true},
+      {app_, kExe, false},         // a file in Applications/, which no bundle holds
+      {app_ + "/X", kDir, false},  // a file is no bundle directory
+  };
+  for (const auto& c : cases) {
+    Bundle bundle = make(c.path, c.kind);
+    EXPECT_EQ(bundle.bundleDirectory().has_value(), c.found) << c.path;
+    if (c.found) {
+      EXPECT_EQ(bundle.property(kBundlePath), Value(app_)) << c.path;
+      EXPECT_EQ(bundle.property(kExecutablePath), Value(app_ + "/X")) << c.path;
+      EXPECT_EQ(bundle.property(kSupportFilesPath), Value(app_)) << c.path;
+      EXPECT_TRUE(bundle.isApplication() && !bundle.isPlugIn()) << c.path;
+      EXPECT_NE(bundle.infoDictionary(), nullptr) << c.path;
+      EXPECT_FALSE(bundle.containingApplication().has_value()) << c.path;
+    } else {
+      for (int number : {kBundlePath, kExecutablePath, kSupportFilesPath}) {
+        EXPECT_TRUE(bundle.property(number).isNone()) << c.path << " " << number;
+      }
+    }
   }
-  EXPECT_TRUE(make(app_, BundlePathKind::Directory).property(7).isNone());
-}
-
-TEST_F(PlatformBundleTest, DirectoryGivenAsExecutablePathWalksUpFromItsParent) {
-  // The bundle directory itself, given as an executable, is a file in
-  // Applications/, which no bundle holds.
-  Bundle outside = make(app_, BundlePathKind::Executable);
-  EXPECT_FALSE(outside.bundleDirectory().has_value());
-  for (int number : {kBundlePath, kExecutablePath, kSupportFilesPath}) {
-    EXPECT_TRUE(outside.property(number).isNone()) << number;
-  }
-  ASSERT_TRUE(outside.infoError().has_value());
-  EXPECT_TRUE(isBundleError(*outside.infoError(), BundleErrorCode::NoBundleDirectory));
-
-  // A directory inside the bundle, given as an executable, finds it.
-  EXPECT_EQ(make(app_ + "/bin", BundlePathKind::Executable).property(kBundlePath), Value(app_));
-  // So does a missing executable whose directory exists.
-  EXPECT_EQ(make(app_ + "/bin/gone", BundlePathKind::Executable).property(kBundlePath),
-            Value(app_));
+  ASSERT_TRUE(make(app_, kExe).infoError().has_value());
+  EXPECT_TRUE(isBundleError(*make(app_, kExe).infoError(), BundleErrorCode::NoBundleDirectory));
+  EXPECT_TRUE(make(app_, kDir).property(7).isNone());
+  Result<Bundle> relative = Bundle::create("Applications/X.app", kDir);
+  ASSERT_FALSE(relative.ok());
+  EXPECT_TRUE(isBundleError(relative.error(), BundleErrorCode::InvalidPath));
 }
 
 TEST_F(PlatformBundleTest, ExecutableAbsentOrOutsideHasNoProperty3) {
@@ -78,17 +90,15 @@ TEST_F(PlatformBundleTest, ExecutableAbsentOrOutsideHasNoProperty3) {
   services_testing::makeDirectories(bundle + "/Dir");
   writeText(bundle + "/sub/real", "binary");
   ASSERT_EQ(::symlink((scratch_ / "outside").c_str(), (bundle + "/escape").c_str()), 0);
-  for (const char* name : {"Missing", "../outside", "escape", "Dir", "/bin/sh"}) {
-    writeVmap(bundle + "/Info.vmap", Dictionary{{"BXExecutable", name}});
+  for (const char* name : {"Missing", "../outside", "escape", "Dir", "/bin/sh", "", "sub/real"}) {
+    writeVmap(bundle + "/Info.vmap", *name ? Dictionary{{"BXExecutable", name}}
+                                           : Dictionary{{"BXBundleName", "B"}});
     Bundle made = make(bundle, BundlePathKind::Directory);
     EXPECT_EQ(made.property(kBundlePath), Value(bundle)) << name;
-    EXPECT_TRUE(made.property(kExecutablePath).isNone()) << name;
+    EXPECT_EQ(made.property(kExecutablePath),
+              std::string(name) == "sub/real" ? Value(bundle + "/sub/real") : Value())
+        << name;
   }
-  writeVmap(bundle + "/Info.vmap", Dictionary{{"BXExecutable", "sub/real"}});
-  EXPECT_EQ(make(bundle, BundlePathKind::Directory).property(kExecutablePath),
-            Value(bundle + "/sub/real"));
-  writeVmap(bundle + "/Info.vmap", Dictionary{{"BXBundleName", "B"}});
-  EXPECT_TRUE(make(bundle, BundlePathKind::Directory).property(kExecutablePath).isNone());
 }
 
 TEST_F(PlatformBundleTest, PlugInInsideAnApplicationKnowsItsApplication) {
@@ -100,9 +110,7 @@ TEST_F(PlatformBundleTest, PlugInInsideAnApplicationKnowsItsApplication) {
   Bundle bundle = make(plugIn + "/p", BundlePathKind::Executable);
   EXPECT_EQ(bundle.property(kBundlePath), Value(plugIn));
   EXPECT_EQ(bundle.property(kSupportFilesPath), Value(plugIn));
-  EXPECT_TRUE(bundle.isPlugIn());
-  EXPECT_TRUE(bundle.isApplicationExtension());
-  EXPECT_FALSE(bundle.isApplication());
+  EXPECT_TRUE(bundle.isPlugIn() && bundle.isApplicationExtension() && !bundle.isApplication());
   std::optional<Bundle> application = bundle.containingApplication();
   ASSERT_TRUE(application.has_value());
   EXPECT_EQ(application->property(kBundlePath), Value(app_));
@@ -113,8 +121,7 @@ TEST_F(PlatformBundleTest, PlugInInsideAnApplicationKnowsItsApplication) {
   const std::string nested = app_ + "/PlugIns/Group/q.bundle";
   writeVmap(nested + "/Info.vmap", Dictionary{{"Quorvex", Dictionary{}}});
   Bundle deep = make(nested, BundlePathKind::Directory);
-  EXPECT_TRUE(deep.isPlugIn());
-  EXPECT_FALSE(deep.isApplicationExtension());
+  EXPECT_TRUE(deep.isPlugIn() && !deep.isApplicationExtension());
   ASSERT_TRUE(deep.containingApplication().has_value());
   EXPECT_EQ(deep.containingApplication()->property(kBundlePath), Value(app_));
   const std::string beside = app_ + "/Resources/r.ovx";
@@ -125,51 +132,25 @@ TEST_F(PlatformBundleTest, PlugInInsideAnApplicationKnowsItsApplication) {
   EXPECT_FALSE(make(beside, BundlePathKind::Directory).isPlugIn());
 }
 
-TEST_F(PlatformBundleTest, ReportedPathsAreCanonical) {
-  ASSERT_EQ(::symlink(app_.c_str(), (scratch_ / "Link.app").c_str()), 0);
-  ASSERT_EQ(::symlink((app_ + "/X").c_str(), (scratch_ / "x-link").c_str()), 0);
-  EXPECT_EQ(make(scratch_ / "Link.app/", BundlePathKind::Directory).property(kBundlePath),
-            Value(app_));
-  EXPECT_EQ(
-      make(scratch_ / "Applications/./X.app//", BundlePathKind::Directory).property(kBundlePath),
-      Value(app_));
-  // A link to the executable finds the bundle the executable lives in.
-  EXPECT_EQ(make(scratch_ / "x-link", BundlePathKind::Executable).property(kBundlePath),
-            Value(app_));
-  Result<Bundle> relative = Bundle::create("Applications/X.app", BundlePathKind::Directory);
-  ASSERT_FALSE(relative.ok());
-  EXPECT_TRUE(isBundleError(relative.error(), BundleErrorCode::InvalidPath));
-}
-
 TEST_F(PlatformBundleTest, MissingOrMalformedManifestLeavesNoInfoButTheError) {
   const std::string bundle = scratch_ / "M.ovx";
+  const std::string info = bundle + "/Info.vmap";
   services_testing::makeDirectories(bundle);
-  Bundle missing = make(bundle, BundlePathKind::Directory);
-  EXPECT_EQ(missing.property(kBundlePath), Value(bundle));
-  EXPECT_EQ(missing.infoDictionary(), nullptr);
-  ASSERT_TRUE(missing.infoError().has_value());
-  EXPECT_TRUE(missing.infoError()->is(kPosixErrorDomain, ENOENT));
-
-  writeText(bundle + "/Info.vmap", "<vmap version=\"1.0\"><dict><key>a</key></dict></vmap>");
-  Bundle malformed = make(bundle, BundlePathKind::Directory);
-  EXPECT_EQ(malformed.infoDictionary(), nullptr);
-  ASSERT_TRUE(malformed.infoError().has_value());
-  EXPECT_EQ(malformed.infoError()->domain(), vmap::kErrorDomain);
-  EXPECT_FALSE(malformed.isPlugIn());
-
-  writeVmap(bundle + "/Info.vmap", Value(Array{Value("XOExtension")}));
-  Bundle array = make(bundle, BundlePathKind::Directory);
-  ASSERT_TRUE(array.infoError().has_value());
-  EXPECT_TRUE(isBundleError(*array.infoError(), BundleErrorCode::InfoNotADictionary));
-
-  writeText(bundle + "/Info.vmap", std::string(Bundle::kMaxInfoBytes + 1, ' '));
-  Bundle huge = make(bundle, BundlePathKind::Directory);
-  ASSERT_TRUE(huge.infoError().has_value());
-  EXPECT_TRUE(huge.infoError()->is(vmap::kErrorDomain,
-                                   static_cast<std::int64_t>(vmap::ErrorCode::TooLarge)));
-
-  // A file given as a bundle directory is none.
-  EXPECT_FALSE(make(app_ + "/X", BundlePathKind::Directory).bundleDirectory().has_value());
+  const auto errorOf = [&](const char* what) {
+    Bundle made = make(bundle, BundlePathKind::Directory);
+    EXPECT_EQ(made.property(kBundlePath), Value(bundle)) << what;
+    EXPECT_EQ(made.infoDictionary(), nullptr) << what;
+    EXPECT_FALSE(made.isPlugIn()) << what;
+    return made.infoError().value_or(Error::posix(0, what));
+  };
+  EXPECT_TRUE(errorOf("missing").is(kPosixErrorDomain, ENOENT));
+  writeText(info, "<vmap version=\"1.0\"><dict><key>a</key></dict></vmap>");
+  EXPECT_EQ(errorOf("malformed").domain(), vmap::kErrorDomain);
+  writeVmap(info, Value(Array{Value("XOExtension")}));
+  EXPECT_TRUE(isBundleError(errorOf("array"), BundleErrorCode::InfoNotADictionary));
+  writeText(info, std::string(Bundle::kMaxInfoBytes + 1, ' '));
+  EXPECT_TRUE(errorOf("huge").is(vmap::kErrorDomain,
+                                 static_cast<std::int64_t>(vmap::ErrorCode::TooLarge)));
 }
 
 }  // namespace

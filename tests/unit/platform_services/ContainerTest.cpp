@@ -17,38 +17,17 @@ namespace {
 
 using services_testing::modeOf;
 using services_testing::ScratchDirectory;
+using services_testing::statOf;
 
-constexpr uid_t kUser = 65534;
-
-uid_t ownerOf(const std::string& path) {
-  struct stat status {};
-  EXPECT_EQ(::lstat(path.c_str(), &status), 0) << path;
-  return status.st_uid;
-}
-
-// Sets the umask for one test and puts the old one back.
-class ScopedUmask {
- public:
-  explicit ScopedUmask(mode_t mask) : old_(::umask(mask)) {}
-  ~ScopedUmask() { ::umask(old_); }
-
- private:
-  mode_t old_;
-};
-
-class PlatformContainerTest : public ::testing::Test {
- protected:
-  ScratchDirectory scratch_;
-};
-
-TEST_F(PlatformContainerTest, MadeUnderTheRootWithExactModes) {
+TEST(PlatformContainerTest, MadeUnderTheRootWithExactModesWhateverTheUmask) {
   for (mode_t mask : {mode_t{022}, mode_t{0277}, mode_t{0}}) {
     ScratchDirectory root;
-    ScopedUmask umask(mask);
+    const mode_t old = ::umask(mask);
     setRootDirectoryForTesting(root.path());
     LinuxContainerManager manager;
     setRootDirectoryForTesting("/");
-    Result<std::string> made = manager.userContainer(kUser, "com.corvane.clock");
+    Result<std::string> made = manager.userContainer(65534, "com.corvane.clock");
+    ::umask(old);
     ASSERT_TRUE(made.ok()) << made.error().description();
     const std::string user = root / "var/containers/User/65534";
     EXPECT_EQ(*made, user + "/com.corvane.clock");
@@ -58,15 +37,16 @@ TEST_F(PlatformContainerTest, MadeUnderTheRootWithExactModes) {
       EXPECT_EQ(modeOf(root / shared), 0711u) << shared << " umask " << std::oct << mask;
     }
     if (::geteuid() == 0) {
-      EXPECT_EQ(ownerOf(*made), kUser);
-      EXPECT_EQ(ownerOf(user), kUser);
-      EXPECT_EQ(ownerOf(root / "var/containers/User"), 0u);
+      EXPECT_EQ(statOf(*made).st_uid, 65534u);
+      EXPECT_EQ(statOf(user).st_uid, 65534u);
+      EXPECT_EQ(statOf(root / "var/containers/User").st_uid, 0u);
     }
   }
 }
 
-TEST_F(PlatformContainerTest, ExistingContainerIsReusedAsItIs) {
-  LinuxContainerManager manager(scratch_ / "User");
+TEST(PlatformContainerTest, ExistingContainerIsReusedAsItIs) {
+  ScratchDirectory scratch;
+  LinuxContainerManager manager(scratch / "User");
   Result<std::string> first = manager.userContainer(1000, "app");
   ASSERT_TRUE(first.ok());
   std::ofstream(*first + "/data") << "kept";
@@ -75,48 +55,49 @@ TEST_F(PlatformContainerTest, ExistingContainerIsReusedAsItIs) {
   ASSERT_TRUE(second.ok());
   EXPECT_EQ(*second, *first);
   EXPECT_EQ(modeOf(*second), 0750u);
-  std::ifstream in(*second + "/data");
-  std::string text;
-  in >> text;
-  EXPECT_EQ(text, "kept");
+  EXPECT_EQ(statOf(*second + "/data").st_size, 4);
   Result<std::string> otherUser = manager.userContainer(1001, "app");
   ASSERT_TRUE(otherUser.ok());
   EXPECT_NE(*otherUser, *first);
 }
 
-TEST_F(PlatformContainerTest, IdentifiersThatLeaveTheUsersDirectoryAreRefused) {
-  LinuxContainerManager manager(scratch_ / "User");
+TEST(PlatformContainerTest, BadIdentifiersAndPlantedLinksAreRefused) {
+  ScratchDirectory scratch;
+  const std::string elsewhere = scratch / "elsewhere";
+  services_testing::makeDirectories(elsewhere);
+  ASSERT_EQ(::chmod(elsewhere.c_str(), 0755), 0);
+  services_testing::makeDirectories(scratch / "User/1000");
+  ASSERT_EQ(::symlink(elsewhere.c_str(), (scratch / "User/1000/app").c_str()), 0);
+  ASSERT_EQ(::symlink(elsewhere.c_str(), (scratch / "User/1001").c_str()), 0);
+  services_testing::writeText(scratch / "User/1000/file", "");
+  const struct {
+    uid_t uid;
+    std::string_view identifier;
+    ContainerErrorCode code;
+  } cases[] = {
+      {1000, "", ContainerErrorCode::InvalidIdentifier},
+      {1000, ".", ContainerErrorCode::InvalidIdentifier},
+      {1000, "..", ContainerErrorCode::InvalidIdentifier},
+      {1000, "a/b", ContainerErrorCode::InvalidIdentifier},
+      {1000, "x..y", ContainerErrorCode::InvalidIdentifier},
+      {1000, std::string_view("nul\0x", 5), ContainerErrorCode::InvalidIdentifier},
+      {1000, "app", ContainerErrorCode::NotADirectory},   // a link to a directory
+      {1001, "app", ContainerErrorCode::NotADirectory},   // the user's directory is a link
+      {1000, "file", ContainerErrorCode::NotADirectory},  // a plain file
+  };
+  LinuxContainerManager manager(scratch / "User");
   FakeContainerManager fake;
-  for (std::string_view identifier :
-       {std::string_view(""), std::string_view("."), std::string_view(".."),
-        std::string_view("a/b"), std::string_view("x..y"), std::string_view("nul\0x", 5)}) {
-    Result<std::string> made = manager.userContainer(1000, identifier);
-    ASSERT_FALSE(made.ok()) << identifier;
-    EXPECT_TRUE(isContainerError(made.error(), ContainerErrorCode::InvalidIdentifier));
-    EXPECT_FALSE(fake.userContainer(1000, identifier).ok());
+  for (const auto& c : cases) {
+    Result<std::string> made = manager.userContainer(c.uid, c.identifier);
+    ASSERT_FALSE(made.ok()) << c.uid << "/" << c.identifier;
+    EXPECT_TRUE(isContainerError(made.error(), c.code)) << made.error().description();
+    if (c.code == ContainerErrorCode::InvalidIdentifier) {
+      EXPECT_FALSE(fake.userContainer(c.uid, c.identifier).ok()) << c.identifier;
+    }
   }
   EXPECT_FALSE(manager.userContainer(1000, std::string(256, 'i')).ok());
   EXPECT_TRUE(manager.userContainer(1000, std::string(255, 'i')).ok());
-  EXPECT_EQ(::access((scratch_ / "User/1000/a").c_str(), F_OK), -1);
-}
-
-TEST_F(PlatformContainerTest, LinksPlantedInPlaceOfDirectoriesAreRefused) {
-  const std::string elsewhere = scratch_ / "elsewhere";
-  services_testing::makeDirectories(elsewhere);
-  ASSERT_EQ(::chmod(elsewhere.c_str(), 0755), 0);
-  services_testing::makeDirectories(scratch_ / "User/1000");
-  ASSERT_EQ(::symlink(elsewhere.c_str(), (scratch_ / "User/1000/app").c_str()), 0);
-  ASSERT_EQ(::symlink(elsewhere.c_str(), (scratch_ / "User/1001").c_str()), 0);
-  services_testing::writeText(scratch_ / "User/1000/file", "");
-
-  LinuxContainerManager manager(scratch_ / "User");
-  for (auto [uid, identifier] :
-       {std::pair<uid_t, const char*>{1000, "app"}, {1001, "app"}, {1000, "file"}}) {
-    Result<std::string> made = manager.userContainer(uid, identifier);
-    ASSERT_FALSE(made.ok()) << uid << "/" << identifier;
-    EXPECT_TRUE(isContainerError(made.error(), ContainerErrorCode::NotADirectory))
-        << made.error().description();
-  }
+  EXPECT_EQ(::access((scratch / "User/1000/a").c_str(), F_OK), -1);
   EXPECT_EQ(modeOf(elsewhere), 0755u);
 }
 

@@ -5,7 +5,6 @@
 #include <sys/stat.h>
 
 #include <chrono>
-#include <filesystem>
 #include <thread>
 
 #include "platform/log/LogCaptureForTesting.h"
@@ -17,40 +16,19 @@
 namespace platform::prefs {
 namespace {
 
-using services_testing::inodeOf;
-using services_testing::ScratchDirectory;
-using services_testing::vmapText;
+using services_testing::statOf;
 using services_testing::writeText;
 using services_testing::writeVmap;
 
-struct timespec mtimeOf(const std::string& path) {
-  struct stat status {};
-  EXPECT_EQ(::stat(path.c_str(), &status), 0);
-  return status.st_mtim;
-}
-
-void setMtime(const std::string& path, struct timespec mtime) {
-  const struct timespec times[2] = {{0, UTIME_OMIT}, mtime};
-  ASSERT_EQ(::utimensat(AT_FDCWD, path.c_str(), times, 0), 0);
-}
-
 class PlatformPrefsTest : public ::testing::Test {
  protected:
-  void SetUp() override { directory_ = scratch_ / "etc/quorvex/preferences"; }
   std::string file(const std::string& domain) const { return directory_ + "/" + domain + ".vmap"; }
-
-  // Waits out the window in which the store re-reads every file anyway, so
-  // that only its signature check decides.
-  static void waitPastRecentWindow() {
-    std::this_thread::sleep_for(std::chrono::milliseconds(2100));
-  }
-
-  ScratchDirectory scratch_;
-  std::string directory_;
+  services_testing::ScratchDirectory scratch_;
+  const std::string directory_ = scratch_ / "etc/quorvex/preferences";
   log::LogCaptureForTesting capture_;
 };
 
-TEST_F(PlatformPrefsTest, ReadsValuesUnderTheRoot) {
+TEST_F(PlatformPrefsTest, ReadsValuesUnderTheRootAndFilesThatComeAndGo) {
   writeVmap(file("com.corvane.qvd"), Dictionary{{"ScanInterval", 30}, {"Verbose", true}});
   setRootDirectoryForTesting(scratch_.path());
   LinuxPreferenceStore store;  // finds <root>/etc/quorvex/preferences
@@ -58,45 +36,6 @@ TEST_F(PlatformPrefsTest, ReadsValuesUnderTheRoot) {
   EXPECT_EQ(store.valueForKey("com.corvane.qvd", "ScanInterval"), Value(30));
   EXPECT_EQ(store.valueForKey("com.corvane.qvd", "Verbose"), Value(true));
   EXPECT_TRUE(store.valueForKey("com.corvane.qvd", "Absent").isNone());
-  EXPECT_TRUE(store.valueForKey("com.corvane.other", "ScanInterval").isNone());
-}
-
-TEST_F(PlatformPrefsTest, SameSizeRewriteWithTouchedMtimeIsRead) {
-  const std::string path = file("d");
-  writeVmap(path, Dictionary{{"k", "aaaa"}});
-  waitPastRecentWindow();
-  LinuxPreferenceStore store(directory_);
-  EXPECT_EQ(store.valueForKey("d", "k"), Value("aaaa"));
-  EXPECT_EQ(store.valueForKey("d", "k"), Value("aaaa"));
-  EXPECT_EQ(store.readsForTesting("d"), 1u);  // the second answer came from the cache
-
-  const ino_t inode = inodeOf(path);
-  const auto size = std::filesystem::file_size(path);
-  struct timespec mtime = mtimeOf(path);
-  writeText(path, vmapText(Dictionary{{"k", "bbbb"}}));
-  mtime.tv_sec += 1;  // touched: only the mtime tells this edit apart
-  setMtime(path, mtime);
-  ASSERT_EQ(inodeOf(path), inode);
-  ASSERT_EQ(std::filesystem::file_size(path), size);
-  EXPECT_EQ(store.valueForKey("d", "k"), Value("bbbb"));
-  EXPECT_EQ(store.readsForTesting("d"), 2u);
-}
-
-TEST_F(PlatformPrefsTest, RewriteThatRestoresTheMtimeIsStillRead) {
-  // Same inode, size and mtime: only the change time gives the edit away.
-  const std::string path = file("d");
-  writeVmap(path, Dictionary{{"k", "aaaa"}});
-  waitPastRecentWindow();
-  LinuxPreferenceStore store(directory_);
-  EXPECT_EQ(store.valueForKey("d", "k"), Value("aaaa"));
-  const struct timespec mtime = mtimeOf(path);
-  writeText(path, vmapText(Dictionary{{"k", "cccc"}}));
-  setMtime(path, mtime);
-  EXPECT_EQ(store.valueForKey("d", "k"), Value("cccc"));
-}
-
-TEST_F(PlatformPrefsTest, MissingFileGivesNoneUntilItAppears) {
-  LinuxPreferenceStore store(directory_);
   EXPECT_TRUE(store.valueForKey("late", "k").isNone());
   writeVmap(file("late"), Dictionary{{"k", 1}});
   EXPECT_EQ(store.valueForKey("late", "k"), Value(1));
@@ -105,17 +44,44 @@ TEST_F(PlatformPrefsTest, MissingFileGivesNoneUntilItAppears) {
   EXPECT_EQ(capture_.size(), 0u);  // a missing file is not a fault
 }
 
+TEST_F(PlatformPrefsTest, SameSizeRewriteIsRead) {
+  // Same inode and size; "touched" moves the mtime on, "restored" puts it
+  // back, so that only the change time gives the edit away.
+  const struct {
+    const char* domain;
+    long mtimeStep;
+  } cases[] = {{"touched", 1}, {"restored", 0}};
+  for (const auto& c : cases) writeVmap(file(c.domain), Dictionary{{"k", "aaaa"}});
+  // Past the window in which the store re-reads every file anyway.
+  std::this_thread::sleep_for(std::chrono::milliseconds(2100));
+  LinuxPreferenceStore store(directory_);
+  for (const auto& c : cases) {
+    EXPECT_EQ(store.valueForKey(c.domain, "k"), Value("aaaa"));
+    EXPECT_EQ(store.valueForKey(c.domain, "k"), Value("aaaa"));
+    EXPECT_EQ(store.readsForTesting(c.domain), 1u) << c.domain;  // the second from the cache
+
+    const struct stat before = statOf(file(c.domain));
+    writeText(file(c.domain), services_testing::vmapText(Dictionary{{"k", "bbbb"}}));
+    const struct timespec times[2] = {
+        {0, UTIME_OMIT}, {before.st_mtim.tv_sec + c.mtimeStep, before.st_mtim.tv_nsec}};
+    ASSERT_EQ(::utimensat(AT_FDCWD, file(c.domain).c_str(), times, 0), 0);
+    const struct stat after = statOf(file(c.domain));
+    ASSERT_EQ(after.st_ino, before.st_ino);
+    ASSERT_EQ(after.st_size, before.st_size);
+    EXPECT_EQ(store.valueForKey(c.domain, "k"), Value("bbbb")) << c.domain;
+    EXPECT_EQ(store.readsForTesting(c.domain), 2u) << c.domain;
+  }
+}
+
 TEST_F(PlatformPrefsTest, MalformedFileGivesNoneAndIsLoggedOncePerChange) {
   LinuxPreferenceStore store(directory_);
   writeText(file("bad"), "<vmap version=\"1.0\"><dict><key>k</key></dict></vmap>");
   for (int i = 0; i < 3; ++i) EXPECT_TRUE(store.valueForKey("bad", "k").isNone());
   EXPECT_EQ(capture_.size(), 1u);
-
   writeVmap(file("bad"), Value(Array{Value(1)}));  // reads, but is no dictionary
   for (int i = 0; i < 3; ++i) EXPECT_TRUE(store.valueForKey("bad", "k").isNone());
   ASSERT_EQ(capture_.size(), 2u);
   EXPECT_NE(capture_.messages()[1].find("not a dictionary"), std::string::npos);
-
   writeVmap(file("bad"), Dictionary{{"k", "fixed"}});
   EXPECT_EQ(store.valueForKey("bad", "k"), Value("fixed"));
   EXPECT_EQ(capture_.size(), 2u);
@@ -128,9 +94,9 @@ TEST_F(PlatformPrefsTest, DomainNamesThatLeaveTheDirectoryAreRefused) {
   writeVmap(file("..hidden"), Dictionary{{"k", 1}});
   writeVmap(file("a/b"), Dictionary{{"k", 1}});
   LinuxPreferenceStore store(directory_);
-  for (std::string_view domain :
-       {std::string_view("../escape"), std::string_view("..hidden"), std::string_view("a/b"),
-        std::string_view(""), std::string_view("x\0y", 3)}) {
+  for (std::string_view domain : {std::string_view("../escape"), std::string_view("..hidden"),
+                                  std::string_view("a/b"), std::string_view(""),
+                                  std::string_view("x\0y", 3)}) {
     EXPECT_TRUE(store.valueForKey(domain, "k").isNone()) << domain;
   }
   FakePreferenceStore fake;

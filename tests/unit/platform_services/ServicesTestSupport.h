@@ -3,7 +3,6 @@
 #pragma once
 
 #include <gtest/gtest.h>
-#include <limits.h>
 #include <stdlib.h>
 #include <sys/stat.h>
 
@@ -17,24 +16,19 @@
 
 namespace platform::services_testing {
 
-// A fresh directory under the temporary directory, with its canonical path
-// (so that tests can compare against realpath results).
+// A fresh directory under the temporary directory, by its canonical path (so
+// that tests can compare against realpath results).
 class ScratchDirectory {
  public:
   ScratchDirectory() {
     std::string pattern = (std::filesystem::temp_directory_path() / "qv-services-XXXXXX").string();
-    char* made = ::mkdtemp(pattern.data());
-    EXPECT_NE(made, nullptr);
-    char resolved[PATH_MAX];
-    path_ = ::realpath(pattern.c_str(), resolved) != nullptr ? resolved : pattern;
+    EXPECT_NE(::mkdtemp(pattern.data()), nullptr);
+    path_ = std::filesystem::canonical(pattern).string();
   }
   ~ScratchDirectory() {
     std::error_code ignored;
     std::filesystem::remove_all(path_, ignored);
   }
-  ScratchDirectory(const ScratchDirectory&) = delete;
-  ScratchDirectory& operator=(const ScratchDirectory&) = delete;
-
   const std::string& path() const { return path_; }
   std::string operator/(const std::string& relative) const { return path_ + "/" + relative; }
 
@@ -42,9 +36,7 @@ class ScratchDirectory {
   std::string path_;
 };
 
-inline void makeDirectories(const std::string& path) {
-  std::filesystem::create_directories(path);
-}
+inline void makeDirectories(const std::string& path) { std::filesystem::create_directories(path); }
 
 // Writes `value` as an XML vmap document (mode 0644), making the directory.
 inline void writeVmap(const std::string& path, const Value& value) {
@@ -56,9 +48,7 @@ inline void writeVmap(const std::string& path, const Value& value) {
 // Writes `text` in place: an existing file keeps its inode.
 inline void writeText(const std::string& path, const std::string& text) {
   makeDirectories(std::filesystem::path(path).parent_path().string());
-  std::ofstream out(path, std::ios::binary | std::ios::trunc);
-  out << text;
-  ASSERT_TRUE(out.good()) << path;
+  std::ofstream(path, std::ios::binary | std::ios::trunc) << text;
 }
 
 // The XML text of `value`, to write in place with writeText.
@@ -68,16 +58,12 @@ inline std::string vmapText(const Value& value) {
   return text.ok() ? *text : std::string();
 }
 
-inline ino_t inodeOf(const std::string& path) {
-  struct stat status {};
-  EXPECT_EQ(::stat(path.c_str(), &status), 0) << path;
-  return status.st_ino;
-}
-
-inline mode_t modeOf(const std::string& path) {
+inline struct stat statOf(const std::string& path) {
   struct stat status {};
   EXPECT_EQ(::lstat(path.c_str(), &status), 0) << path;
-  return status.st_mode & 07777;
+  return status;
 }
+
+inline mode_t modeOf(const std::string& path) { return statOf(path).st_mode & 07777; }
 
 }  // namespace platform::services_testing
