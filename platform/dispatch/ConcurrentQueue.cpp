@@ -34,4 +34,9 @@ void ConcurrentQueue::sync(Closure work) {
   work();
 }
 
+void ConcurrentQueue::runClaimed(Closure& work) {
+  internal::ScopedQueueFrame frame(this);
+  work();
+}
+
 }  // namespace platform::dispatch

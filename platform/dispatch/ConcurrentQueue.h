@@ -24,6 +24,9 @@ class ConcurrentQueue final : public Queue {
 
  private:
   explicit ConcurrentQueue(Priority priority);
+  // Always: items of a concurrent queue need no turn.
+  bool tryClaim() override { return true; }
+  void runClaimed(Closure& work) override;
 };
 
 }  // namespace platform::dispatch

@@ -12,6 +12,14 @@ Queue::Queue(std::string_view label, Priority priority)
 
 Queue::~Queue() = default;
 
+bool Queue::tryClaim() {
+  return false;
+}
+
+void Queue::runClaimed(Closure&) {
+  internal::fatal("queue '%s' asked to run work it never claimed", label_.c_str());
+}
+
 bool Queue::isCurrent() const {
   return internal::chainContains(this);
 }

@@ -14,6 +14,8 @@
 
 namespace platform::dispatch {
 
+class FdSource;
+
 class Queue : public std::enable_shared_from_this<Queue> {
  public:
   virtual ~Queue();
@@ -46,6 +48,18 @@ class Queue : public std::enable_shared_from_this<Queue> {
   Queue(std::string_view label, Priority priority);
 
  private:
+  friend class FdSource;
+  // For an event source on a pool thread that has just taken its event:
+  // claims the queue when the work could start here and now without
+  // breaking the queue's order or exclusion (an idle serial queue, a
+  // concurrent queue). The main queue never can. On true the caller must
+  // call runClaimed() next, on the same thread.
+  virtual bool tryClaim();
+  // Runs `work` as an item of this queue on the calling thread, then lets
+  // the queue go on with whatever was posted meanwhile.
+  // REQUIRES: tryClaim() returned true on this thread.
+  virtual void runClaimed(Closure& work);
+
   const std::string label_;
   const Priority priority_;
 };

@@ -22,10 +22,10 @@ void SerialQueue::async(Closure work) {
     if (state_ != State::Idle) return;
     state_ = State::Scheduled;
   }
-  schedule();
+  schedule(internal::Handoff::WakeIdle);
 }
 
-void SerialQueue::schedule() {
+void SerialQueue::schedule(internal::Handoff handoff) {
   auto self = std::static_pointer_cast<SerialQueue>(shared_from_this());
   internal::ThreadPool::instance().post(
       priority(),
@@ -33,7 +33,7 @@ void SerialQueue::schedule() {
         SerialQueue* queue = self.get();
         queue->drain(std::move(self));
       },
-      nullptr);
+      nullptr, handoff);
 }
 
 void SerialQueue::sync(Closure work) {
@@ -47,7 +47,7 @@ void SerialQueue::sync(Closure work) {
     std::lock_guard<std::mutex> lock(mu_);
     runInline = state_ == State::Idle;
     if (runInline) {
-      state_ = State::RunningSync;
+      state_ = State::RunningInline;
     } else {
       items_.push_back(Item{Closure(), &waiter});
     }
@@ -62,6 +62,29 @@ void SerialQueue::sync(Closure work) {
     internal::ScopedQueueFrame frame(this);
     work();
   }
+  // The caller goes on with its own work: someone else must take the turn.
+  finishInline(internal::Handoff::WakeIdle);
+}
+
+bool SerialQueue::tryClaim() {
+  // Exactly the test sync() makes: only an idle queue can start work on
+  // the caller's thread without overtaking or overlapping anything.
+  std::lock_guard<std::mutex> lock(mu_);
+  if (state_ != State::Idle) return false;
+  state_ = State::RunningInline;
+  return true;
+}
+
+void SerialQueue::runClaimed(Closure& work) {
+  {
+    internal::ScopedQueueFrame frame(this);
+    work();
+  }
+  // Only the pool's event loop claims: its thread looks for work next.
+  finishInline(internal::Handoff::CallerComesBack);
+}
+
+void SerialQueue::finishInline(internal::Handoff handoff) {
   {
     std::lock_guard<std::mutex> lock(mu_);
     if (items_.empty()) {
@@ -70,7 +93,7 @@ void SerialQueue::sync(Closure work) {
     }
     state_ = State::Scheduled;
   }
-  schedule();
+  schedule(handoff);
 }
 
 void SerialQueue::drain([[maybe_unused]] std::shared_ptr<SerialQueue> keepAlive) {
@@ -97,7 +120,8 @@ void SerialQueue::drain([[maybe_unused]] std::shared_ptr<SerialQueue> keepAlive)
     state_ = State::Scheduled;
   }
   // Back of the line at this priority: other queues get their turn first.
-  schedule();
+  // This thread comes back for the most urgent job as soon as it returns.
+  schedule(internal::Handoff::CallerComesBack);
 }
 
 void SerialQueue::runItem(Item& item) {

@@ -22,7 +22,8 @@
 namespace platform::dispatch {
 namespace internal {
 class SyncWaiter;
-}
+enum class Handoff;
+}  // namespace internal
 
 class SerialQueue final : public Queue {
  public:
@@ -46,18 +47,22 @@ class SerialQueue final : public Queue {
     internal::SyncWaiter* waiter = nullptr;  // or a sync caller waiting for its work
   };
   enum class State {
-    Idle,         // no items, nothing running
-    Scheduled,    // has items and a pending turn on the pool
-    Draining,     // a pool thread is running its items
-    RunningSync,  // a sync caller runs work inline
+    Idle,           // no items, nothing running
+    Scheduled,      // has items and a pending turn on the pool
+    Draining,       // a pool thread is running its items
+    RunningInline,  // a sync caller or an event source runs work on its own thread
   };
 
   SerialQueue(std::string_view label, Priority priority);
-  // Gives the queue a turn on the pool.
-  void schedule();
+  // Gives the queue a turn on the pool; `handoff` as for ThreadPool::post.
+  void schedule(internal::Handoff handoff);
   // One turn: runs up to kBatchLimit items, then yields or goes idle.
   void drain(std::shared_ptr<SerialQueue> keepAlive);
   void runItem(Item& item);
+  // Ends a RunningInline turn: idle, or a turn on the pool for what came.
+  void finishInline(internal::Handoff handoff);
+  bool tryClaim() override;
+  void runClaimed(Closure& work) override;
 
   mutable std::mutex mu_;
   std::deque<Item> items_;

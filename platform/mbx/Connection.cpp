@@ -60,17 +60,23 @@ Result<std::shared_ptr<Connection>> Connection::adopt(std::string_view serviceNa
   auto socket = std::make_shared<internal::SocketHandle>(fd);
   std::shared_ptr<Connection> connection(new Connection(serviceName, socket, std::move(peer), limits));
   std::weak_ptr<Connection> weak = connection;
-  // The sources hold the connection weakly: only resume() keeps it alive on
+  // The source holds the connection weakly: only resume() keeps it alive on
   // its own, so a connection nobody resumed or kept goes away.
-  auto read = dispatch::FdSource::create(
-      connection->queue_->label() + " read", dispatch::Priority::Default, fd,
-      dispatch::FdSource::Event::Readable, connection->queue_, [weak] {
-        if (auto self = weak.lock()) self->onReadable();
+  using Readiness = dispatch::FdSource::Readiness;
+  auto source = dispatch::FdSource::createTwoWay(
+      connection->queue_->label(), dispatch::Priority::Default, fd, connection->queue_,
+      [weak] {
+        auto self = weak.lock();
+        return self ? self->onReadable() : Readiness::Drained;
+      },
+      [weak] {
+        auto self = weak.lock();
+        return self ? self->onWritable() : Readiness::Drained;
       });
-  if (!read) return makeError(ErrorCode::SocketFailure, read.message());
+  if (!source) return makeError(ErrorCode::SocketFailure, source.message());
   // The source keeps the descriptor open until the reactor has let go of it.
-  read.value()->setCancelHandler([socket] { (void)socket; });
-  connection->readSource_ = std::move(read).value();
+  source.value()->setCancelHandler([socket] { (void)socket; });
+  connection->source_ = std::move(source).value();
   return connection;
 }
 
@@ -84,8 +90,7 @@ Result<std::shared_ptr<Connection>> Connection::connectToService(std::string_vie
 }
 
 Connection::~Connection() {
-  if (readSource_) readSource_->cancel();
-  if (writeSource_) writeSource_->cancel();  // no other reference is left to race with
+  if (source_) source_->cancel();
   // Only a connection that was never resumed, or whose invalidation has run,
   // gets here; in the first case its requests and context are still held.
   for (PendingReply& reply : pending_.takeAll()) {
@@ -111,7 +116,7 @@ void Connection::resume() {
     state_ = State::Active;
     selfWhileActive_ = shared_from_this();
   }
-  readSource_->resume();
+  source_->resume(dispatch::FdSource::Event::Readable);
 }
 
 void Connection::cancel() {
@@ -119,18 +124,25 @@ void Connection::cancel() {
   queue_->async([self = shared_from_this()] { self->invalidate(); });
 }
 
-void Connection::onReadable() {
-  if (invalidated_) return;
+dispatch::FdSource::Readiness Connection::onReadable() {
+  using Readiness = dispatch::FdSource::Readiness;
+  // Once the connection ends its source is cancelled: what it answers no
+  // longer matters.
+  if (invalidated_) return Readiness::Drained;
   std::uint8_t chunk[ConnectionLimits::kReadChunkBytes];
   for (int reads = 0; reads < limits_.maxReadsPerTurn; ++reads) {
-    if (cancelled_.load(std::memory_order_relaxed)) return invalidate();
+    if (cancelled_.load(std::memory_order_relaxed)) {
+      invalidate();
+      return Readiness::Drained;
+    }
     ssize_t n = ::recv(fd_, chunk, sizeof chunk, MSG_DONTWAIT);
     if (n < 0) {
       const int err = errno;
       if (err == EINTR) continue;
-      if (err == EAGAIN || err == EWOULDBLOCK) return;
+      if (err == EAGAIN || err == EWOULDBLOCK) return Readiness::Drained;
       mbxLog().info("%{public}s: closing: read failed: %{errno}d", description(), err);
-      return invalidate();
+      invalidate();
+      return Readiness::Drained;
     }
     if (n == 0) {
       if (Status ended = reader_.finish(); !ended.ok()) {
@@ -138,22 +150,27 @@ void Connection::onReadable() {
       } else {
         mbxLog().debug("%{public}s: the peer closed the connection", description());
       }
-      return invalidate();
+      invalidate();
+      return Readiness::Drained;
     }
     std::span<const std::uint8_t> input(chunk, static_cast<std::size_t>(n));
     while (!input.empty()) {
       Result<std::optional<Frame>> step = reader_.next(input);
       if (!step.ok()) {
         logBrokenFrame(step.error());
-        return invalidate();
+        invalidate();
+        return Readiness::Drained;
       }
       if (!step.value().has_value()) break;
       handleFrame(std::move(*step.value()));
-      if (invalidated_) return;
+      if (invalidated_) return Readiness::Drained;
     }
-    // A short read means the socket is drained; readiness brings us back.
-    if (static_cast<std::size_t>(n) < sizeof chunk) return;
+    // A short read of a stream socket means it was emptied: whatever comes
+    // next is a new arrival, and the source reports it.
+    if (static_cast<std::size_t>(n) < sizeof chunk) return Readiness::Drained;
   }
+  // Stopped to let other connections have the pool: more may be waiting.
+  return Readiness::MayRemain;
 }
 
 void Connection::logBrokenFrame(const Error& error) const {
@@ -216,9 +233,8 @@ void Connection::invalidate() {
     pending = pending_.takeAll();
     output_.clear();
     socket = std::move(socket_);
-    if (writeSource_) writeSource_->cancel();
   }
-  readSource_->cancel();
+  source_->cancel();
   // The peer sees the end now, and a thread waiting in readUntilDone wakes,
   // even while references keep the descriptor open a little longer.
   ::shutdown(fd_, SHUT_RDWR);

@@ -139,12 +139,10 @@ class Connection : public std::enable_shared_from_this<Connection> {
   void readUntilDone(const SyncWaiter& waiter, int fd);
   // REQUIRES: mu_ held. Asks the delivery queue to end the connection.
   void closeLaterLocked();
-  // REQUIRES: mu_ held. Makes writeSource_; false (logged) when it cannot.
-  bool makeWriteSourceLocked();
 
-  // Delivery-queue work.
-  void onReadable();
-  void onWritable();
+  // Delivery-queue work. The handlers say whether they went on until EAGAIN.
+  dispatch::FdSource::Readiness onReadable();
+  dispatch::FdSource::Readiness onWritable();
   void handleFrame(Frame frame);
   void logBrokenFrame(const platform::Error& error) const;
   void invalidate();
@@ -155,7 +153,9 @@ class Connection : public std::enable_shared_from_this<Connection> {
   const std::shared_ptr<const PeerIdentity> peer_;
   const std::shared_ptr<dispatch::SerialQueue> queue_;
   const int fd_;  // usable while the connection is valid
-  std::shared_ptr<dispatch::FdSource> readSource_;  // set by adopt(), then constant
+  // The socket's one source, set by adopt(), then constant. It watches reads
+  // while the connection is active and writes while output is queued.
+  std::shared_ptr<dispatch::FdSource> source_;
 
   // Only touched on the delivery queue (the handler also before resume()).
   FrameReader reader_;
@@ -170,9 +170,7 @@ class Connection : public std::enable_shared_from_this<Connection> {
   std::shared_ptr<internal::SocketHandle> socket_;  // guarded by mu_
   std::uint64_t lastSentId_ = 0;            // guarded by mu_
   internal::OutputQueue output_;            // guarded by mu_
-  // Made when output first backs up; watched while output is queued.
-  std::shared_ptr<dispatch::FdSource> writeSource_;  // guarded by mu_
-  bool writeWatched_ = false;               // guarded by mu_
+  bool writeWatched_ = false;               // guarded by mu_: output is queued
   internal::PendingReplies pending_;        // guarded by mu_
   bool syncReader_ = false;                 // guarded by mu_: a sync waiter reads
   std::shared_ptr<Connection> selfWhileActive_;  // guarded by mu_

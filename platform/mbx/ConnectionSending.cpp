@@ -1,6 +1,5 @@
 // The outgoing half of Connection: message ids, direct writes, the output
 // queue and its limit, and synchronous waits.
-#include <fcntl.h>
 #include <poll.h>
 #include <sys/socket.h>
 
@@ -73,14 +72,15 @@ Result<Message> Connection::sendWithReplySync(Value body) {
     }
   }
   if (socket) {
-    // The waiting thread reads the reply itself: the reactor is told to
-    // leave the socket alone meanwhile, which saves two thread hops.
-    readSource_->suspend();
+    // The waiting thread reads the reply itself: the source stops watching
+    // reads meanwhile, so no pool thread wakes for the reply only to hand
+    // it over.
+    source_->suspend(dispatch::FdSource::Event::Readable);
     Status sent = transmit(std::move(frame).value(), &pending);
     if (sent.ok()) readUntilDone(*waiter, socket->fd());
     // Resumed before the role is given up: the next waiter's suspend() must
     // come after this, or the reactor could take its reply while it polls.
-    readSource_->resume();
+    source_->resume(dispatch::FdSource::Event::Readable);
     {
       std::lock_guard<std::mutex> lock(mu_);
       syncReader_ = false;
@@ -109,7 +109,7 @@ void Connection::readUntilDone(const SyncWaiter& waiter, int fd) {
     // On the delivery queue (inline when it is idle), so that every event
     // keeps its place in the connection's order.
     queue_->sync([this, &waiter] {
-      if (!waiter.done.load(std::memory_order_acquire)) onReadable();
+      if (!waiter.done.load(std::memory_order_acquire)) (void)onReadable();
     });
   }
 }
@@ -169,43 +169,12 @@ Status Connection::transmit(std::vector<std::uint8_t> frame, PendingReply* pendi
     closeLaterLocked();
     return okStatus();
   }
-  if (!writeSource_ && !makeWriteSourceLocked()) {
-    closeLaterLocked();
-    return okStatus();
-  }
   if (!writeWatched_) {
+    // The socket's own source takes on writability until the queue drains.
     writeWatched_ = true;
-    writeSource_->resume();
+    source_->resume(dispatch::FdSource::Event::Writable);
   }
   return okStatus();
-}
-
-bool Connection::makeWriteSourceLocked() {
-  // epoll watches a descriptor once, and the read source has this one; the
-  // write source gets a duplicate of its own. Only connections whose output
-  // ever backs up pay for it.
-  int duplicate = ::fcntl(fd_, F_DUPFD_CLOEXEC, 0);
-  if (duplicate < 0) {
-    const int err = errno;
-    mbxLog().error("%{public}s: closing: cannot wait for the socket to drain: %{errno}d",
-                   description(), err);
-    return false;
-  }
-  auto handle = std::make_shared<internal::SocketHandle>(duplicate);
-  auto source = dispatch::FdSource::create(
-      queue_->label() + " write", dispatch::Priority::Default, duplicate,
-      dispatch::FdSource::Event::Writable, queue_,
-      [weak = weak_from_this()] {
-        if (auto self = weak.lock()) self->onWritable();
-      });
-  if (!source) {
-    mbxLog().error("%{public}s: closing: cannot wait for the socket to drain: %{public}s",
-                   description(), source.message());
-    return false;
-  }
-  source.value()->setCancelHandler([handle] { (void)handle; });
-  writeSource_ = std::move(source).value();
-  return true;
 }
 
 void Connection::closeLaterLocked() {
@@ -215,22 +184,25 @@ void Connection::closeLaterLocked() {
   queue_->async([self = shared_from_this()] { self->invalidate(); });
 }
 
-void Connection::onWritable() {
+dispatch::FdSource::Readiness Connection::onWritable() {
+  using Readiness = dispatch::FdSource::Readiness;
   std::lock_guard<std::mutex> lock(mu_);
-  if (state_ == State::Invalid || closing_) return;
+  if (state_ == State::Invalid || closing_) return Readiness::Drained;
   int err = 0;
   switch (output_.flushTo(fd_, &err)) {
     case internal::OutputQueue::Flush::Drained:
       writeWatched_ = false;
-      writeSource_->suspend();
-      return;
+      source_->suspend(dispatch::FdSource::Event::Writable);
+      return Readiness::Drained;
     case internal::OutputQueue::Flush::WouldBlock:
-      return;
+      // Written until EAGAIN: room freed by the peer is a new report.
+      return Readiness::Drained;
     case internal::OutputQueue::Flush::Failed:
       mbxLog().info("%{public}s: closing: write failed: %{errno}d", description(), err);
       closeLaterLocked();
-      return;
+      return Readiness::Drained;
   }
+  return Readiness::Drained;
 }
 
 }  // namespace platform::mbx

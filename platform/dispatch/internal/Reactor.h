@@ -1,9 +1,11 @@
-// The one thread ("qv-reactor") that waits for file descriptors and timers.
-// It owns an epoll set; event sources register their fds in it and are told
-// when they are ready, on this thread, so they can post their handlers to
-// their queues. When several sources are ready in the same wakeup they are
-// told in priority order (then oldest first). It also keeps the deadlines
-// of after() on one timerfd. The thread starts on first use.
+// The epoll set behind every event source, and the deadlines of after().
+// It owns no thread: idle pool threads wait in it (see ThreadPool), so the
+// thread that takes an event can often run the handler itself instead of
+// handing it to another thread. Sources register their fds here and are
+// told when they are ready; sources ready in the same wakeup are told in
+// priority order (then oldest first). The pool's own wake-up signal for
+// posted work travels through the same set, so an idle thread waits for
+// work and for events in one place.
 //
 // Thread safety: all members are safe to call from any thread.
 #pragma once
@@ -27,17 +29,34 @@ class Queue;
 
 namespace platform::dispatch::internal {
 
+// Lets a ready target run its handler on the pool thread that took the
+// event, when the pool can spare that thread for it.
+class RunSlot {
+ public:
+  virtual ~RunSlot() = default;
+  // True when the calling thread may run one handler of `priority` now:
+  // the pool is below its target and no more urgent job is waiting. Once
+  // granted, the thread counts as running until the pool's loop resumes.
+  virtual bool acquire(Priority priority) = 0;
+  // Hands back a slot acquired but not used.
+  virtual void release() = 0;
+};
+
 // What the reactor tells about readiness.
 class ReadyTarget {
  public:
   virtual ~ReadyTarget() = default;
-  // Called on the reactor thread: keep it short and never block.
-  virtual void onReady() = 0;
+  // Called on the thread that took the event, with the epoll bits. When
+  // `slot` is not null the target may acquire it and return work the caller
+  // runs right after every other target of the wakeup has been told;
+  // otherwise it posts its handler and returns an empty Closure. Keep it
+  // short and never block.
+  virtual Closure onReady(std::uint32_t events, RunSlot* slot) = 0;
 };
 
 class Reactor {
  public:
-  // The process-wide reactor; starts its thread on first call. Never destroyed.
+  // The process-wide reactor. Never destroyed.
   static Reactor& instance();
 
   // Makes `target` known under a new key; the reactor holds it until remove().
@@ -55,13 +74,41 @@ class Reactor {
   // Posts `work` to `queue` once `delay` has passed.
   void after(std::chrono::nanoseconds delay, std::shared_ptr<Queue> queue, Closure work);
 
-  // Holds the reactor thread between two wakeups until resumeForTesting(),
-  // so that a test can make several sources ready "at the same moment".
+  // Ready events taken from the kernel per wakeup.
+  static constexpr int kMaxEventsPerWakeup = 64;
+
+  struct Ready {
+    Priority priority;
+    std::uint64_t key;
+    std::uint32_t events;
+    std::shared_ptr<ReadyTarget> target;
+  };
+  // One wakeup's worth of events, sorted for delivery.
+  struct Harvest {
+    bool polled = false;  // wait() entered the kernel; deliver() must follow
+    bool woken = false;   // wakeOne() was among the events
+    bool timers = false;  // an after() deadline may have passed
+    int count = 0;
+    Ready ready[kMaxEventsPerWakeup];
+  };
+
+  // Waits for events for up to `timeout` and fills `out`. Returns at once,
+  // with nothing, while paused. REQUIRES: deliver(out) is called next.
+  void wait(std::chrono::steady_clock::duration timeout, Harvest& out);
+  // Tells the harvested targets, in order, and fires due after() work.
+  // Returns the handler work one of them claimed for the calling thread
+  // through `slot` (at most one), to be run by the caller.
+  Closure deliver(Harvest& harvest, RunSlot* slot);
+
+  // Makes one thread waiting in wait() return with `woken` set (or the next
+  // one to call it, if none waits). Used by the pool for posted work.
+  void wakeOne();
+
+  // Keeps every thread out of wait() until resumeForTesting(), and returns
+  // once none is inside, so that a test can make several sources ready "at
+  // the same moment". Also used to make waiting threads notice new limits.
   void pauseForTesting();
   void resumeForTesting();
-
-  // Ready events taken from the kernel per wakeup.
-  static constexpr int kMaxEventsPerWakeup = 256;
 
  private:
   struct Entry {
@@ -76,14 +123,13 @@ class Reactor {
   };
 
   Reactor();
-  void threadMain();
-  void deliver(const epoll_event* events, int count);
   void fireDueTimers();
   void armTimerFdLocked();
-  void honourPause();
+  void leavePoll();
 
   int epollFd_ = -1;
-  int wakeFd_ = -1;   // eventfd: interrupts epoll_wait
+  int wakeFd_ = -1;   // eventfd, edge-triggered: one signal wakes one waiter
+  int kickFd_ = -1;   // eventfd, level-triggered: every waiter returns
   int timerFd_ = -1;  // timerfd: the earliest after() deadline
 
   std::mutex entriesMu_;
@@ -97,7 +143,7 @@ class Reactor {
   std::mutex pauseMu_;
   std::condition_variable pauseCv_;
   bool pauseRequested_ = false;
-  bool paused_ = false;
+  int activePolls_ = 0;  // threads between entering wait() and leaving deliver()
 };
 
 }  // namespace platform::dispatch::internal

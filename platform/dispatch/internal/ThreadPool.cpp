@@ -8,6 +8,7 @@
 
 #include "platform/dispatch/internal/Fatal.h"
 #include "platform/dispatch/internal/QueueFrame.h"
+#include "platform/dispatch/internal/Reactor.h"
 #include "platform/dispatch/internal/Thread.h"
 
 namespace platform::dispatch::internal {
@@ -24,6 +25,49 @@ int cpuCount() {
 
 }  // namespace
 
+// The calling idle thread's permission to run one event handler itself.
+class ThreadPool::Slot final : public RunSlot {
+ public:
+  explicit Slot(ThreadPool& pool) : pool_(pool) {}
+
+  bool acquire(Priority priority) override {
+    unsigned newThread;
+    {
+      std::lock_guard<std::mutex> lock(pool_.mu_);
+      if (held_ || pool_.counts_.running >= pool_.limits_.target ||
+          pool_.moreUrgentJobLocked(priority)) {
+        return false;
+      }
+      held_ = true;
+      --pool_.counts_.idle;
+      ++pool_.counts_.running;
+      // Jobs the wake signal was for, and events from now on, need someone
+      // else: pass the signal on, or start a thread if none is left idle.
+      newThread = pool_.wakeOrGrowLocked();
+    }
+    if (newThread != 0) pool_.startWorker(newThread);
+    return true;
+  }
+
+  void release() override {
+    std::lock_guard<std::mutex> lock(pool_.mu_);
+    giveBackLocked();
+  }
+
+  // REQUIRES: pool_.mu_ held. Makes the thread idle again if it ran.
+  bool giveBackLocked() {
+    if (!held_) return false;
+    held_ = false;
+    --pool_.counts_.running;
+    ++pool_.counts_.idle;
+    return true;
+  }
+
+ private:
+  ThreadPool& pool_;
+  bool held_ = false;
+};
+
 ThreadPool& ThreadPool::instance() {
   // Never destroyed: pool threads may still be finishing jobs while static
   // destructors run at exit.
@@ -39,27 +83,42 @@ bool ThreadPool::onPoolThread() {
   return tOnPool;
 }
 
-void ThreadPool::post(Priority priority, Closure job, const Queue* runAs) {
+void ThreadPool::post(Priority priority, Closure job, const Queue* runAs, Handoff handoff) {
   unsigned newThread;
   {
     std::lock_guard<std::mutex> lock(mu_);
     queues_[priorityIndex(priority)].push_back(Job{std::move(job), runAs});
     ++ready_;
+    newThread = wakeOrGrowLocked(tOnPool ? handoff : Handoff::WakeIdle);
+  }
+  if (newThread != 0) startWorker(newThread);
+}
+
+void ThreadPool::keepAWaiter() {
+  unsigned newThread;
+  {
+    std::lock_guard<std::mutex> lock(mu_);
     newThread = wakeOrGrowLocked();
   }
   if (newThread != 0) startWorker(newThread);
 }
 
-unsigned ThreadPool::wakeOrGrowLocked() {
-  if (ready_ == 0) return 0;
-  // Enough threads are at work; when one of them blocks or finishes it
-  // comes back here or takes the next job itself.
-  if (counts_.running >= limits_.target) return 0;
-  if (counts_.idle > 0) wake_.notify_one();
-  if (ready_ <= static_cast<std::size_t>(counts_.idle)) return 0;
-  if (counts_.running + counts_.idle >= limits_.target) return 0;
+unsigned ThreadPool::wakeOrGrowLocked(Handoff handoff) {
+  // A busy serial queue going to the back of the line would otherwise wake
+  // a thread that finds its own job already taken, once per batch.
+  if (handoff == Handoff::WakeIdle && ready_ > 0 && counts_.running < limits_.target &&
+      counts_.idle > 0 && !wakePending_) {
+    wakePending_ = true;
+    Reactor::instance().wakeOne();
+  }
+  // A thread that just started counts as idle until it takes its first job,
+  // so the next call does not start another one for the same reason.
+  const bool needWaiter = counts_.idle == 0;
+  const bool needWorker = ready_ > static_cast<std::size_t>(counts_.idle) &&
+                          counts_.running + counts_.idle < limits_.target;
+  if (!needWaiter && !needWorker) return 0;
   if (counts_.threads >= limits_.cap) {
-    if (counts_.running + counts_.idle == 0) {
+    if (ready_ > 0 && counts_.running + counts_.idle == 0) {
       fatal(
           "all %d pool threads are blocked while %zu job(s) wait to run; work that blocks "
           "on other queued work has exhausted the pool (raise the cap only if this is not "
@@ -68,8 +127,6 @@ unsigned ThreadPool::wakeOrGrowLocked() {
     }
     return 0;
   }
-  // The new thread counts as idle until it takes its first job, so the next
-  // post does not start another one for the same job.
   ++counts_.threads;
   ++counts_.idle;
   return ++nextThreadNumber_;
@@ -91,16 +148,28 @@ bool ThreadPool::popLocked(Job& out) {
   return false;
 }
 
+bool ThreadPool::moreUrgentJobLocked(Priority priority) const {
+  for (int i = kPriorityCount - 1; i > priorityIndex(priority); --i) {
+    if (!queues_[i].empty()) return true;
+  }
+  return false;
+}
+
 void ThreadPool::workerMain() {
   tOnPool = true;
+  Reactor& reactor = Reactor::instance();
+  Reactor::Harvest harvest;
   std::unique_lock<std::mutex> lock(mu_);
   auto idleSince = std::chrono::steady_clock::now();
+  bool ranWork = false;  // idleSince is then reset from the next clock reading
   for (;;) {
     Job job;
     if (counts_.running < limits_.target && popLocked(job)) {
       --counts_.idle;
       ++counts_.running;
+      unsigned newThread = wakeOrGrowLocked();
       lock.unlock();
+      if (newThread != 0) startWorker(newThread);
       if (job.runAs != nullptr) {
         ScopedQueueFrame frame(job.runAs);
         job.work();
@@ -113,20 +182,42 @@ void ThreadPool::workerMain() {
       lock.lock();
       --counts_.running;
       ++counts_.idle;
-      idleSince = std::chrono::steady_clock::now();
+      ranWork = true;
       continue;
     }
-    auto deadline = idleSince + limits_.idleRetire;
-    if (wake_.wait_until(lock, deadline) == std::cv_status::timeout &&
-        std::chrono::steady_clock::now() >= idleSince + limits_.idleRetire) {
+    // One clock reading per wait: it is on the path of every event.
+    const auto now = std::chrono::steady_clock::now();
+    if (ranWork) {
+      idleSince = now;
+      ranWork = false;
+    }
+    if (now >= idleSince + limits_.idleRetire) {
       bool canTakeWork = ready_ > 0 && counts_.running < limits_.target;
-      if (!canTakeWork && counts_.threads - counts_.blocked > limits_.target) {
+      if (!canTakeWork && counts_.threads - counts_.blocked > limits_.target && counts_.idle > 1) {
         --counts_.idle;
         --counts_.threads;
         return;
       }
-      idleSince = std::chrono::steady_clock::now();
+      idleSince = now;
     }
+    const auto timeout = idleSince + limits_.idleRetire - now;
+    lock.unlock();
+
+    reactor.wait(timeout, harvest);
+    if (harvest.woken) {
+      lock.lock();
+      wakePending_ = false;  // taken: the jobs are ours to look at next
+      lock.unlock();
+    }
+    Slot slot(*this);
+    Closure here = reactor.deliver(harvest, &slot);
+    if (here) {
+      handlersRunInPlace_.fetch_add(1, std::memory_order_relaxed);
+      here();
+      here.reset();
+    }
+    lock.lock();
+    if (slot.giveBackLocked()) ranWork = true;
   }
 }
 
@@ -159,15 +250,22 @@ PoolCounts ThreadPool::counts() const {
   return counts_;
 }
 
+std::uint64_t ThreadPool::handlersRunInPlaceForTesting() const {
+  return handlersRunInPlace_.load(std::memory_order_relaxed);
+}
+
 void ThreadPool::setLimitsForTesting(const PoolLimits& limits) {
   unsigned newThread;
   {
     std::lock_guard<std::mutex> lock(mu_);
     limits_ = limits;
-    wake_.notify_all();
     newThread = wakeOrGrowLocked();
   }
   if (newThread != 0) startWorker(newThread);
+  // Threads waiting for events took their retirement deadline from the old
+  // limits: have them come out and look again.
+  Reactor::instance().pauseForTesting();
+  Reactor::instance().resumeForTesting();
 }
 
 }  // namespace platform::dispatch::internal

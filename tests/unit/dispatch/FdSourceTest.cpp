@@ -190,7 +190,8 @@ TEST(DispatchFdSource, WatchesWritabilityAndRefusesWhatEpollCannotWatch) {
   ASSERT_TRUE(source);
   source->resume();
   EXPECT_EQ(writable.waitFor(5s), WaitResult::Succeeded);
-  source->cancel();
+  // Still writable, so reported again and again until the cancel is done.
+  EXPECT_TRUE(testing::cancelAndWait(source));
 
   auto bad =
       FdSource::create("test.bad", Priority::Default, -1, FdSource::Event::Readable, queue, [] {});
@@ -239,7 +240,7 @@ TEST(DispatchFdSource, SourcesReadyTogetherAreDeliveredInPriorityOrder) {
   for (int fd : fds) close(fd);
 }
 
-TEST(DispatchFdSource, ThousandsOfSourcesShareOneReactorAndABoundedPool) {
+TEST(DispatchFdSource, ThousandsOfSourcesShareABoundedPool) {
   constexpr int kSources = 5000;
   rlimit limit;
   getrlimit(RLIMIT_NOFILE, &limit);
@@ -269,7 +270,6 @@ TEST(DispatchFdSource, ThousandsOfSourcesShareOneReactorAndABoundedPool) {
   ASSERT_TRUE(testing::eventually([&] { return fired == kSources; }, 20s)) << fired.load();
   int threads = testing::processThreadCount();
   EXPECT_TRUE(threads > 0 && threads < 64) << threads << " threads: one per source?";
-  EXPECT_EQ(testing::threadsNamed("qv-reactor"), 1);
   for (auto& s : sources) s->cancel();
   ASSERT_TRUE(testing::eventually([&] { return closed == kSources; }, 20s)) << closed.load();
 }

@@ -8,6 +8,8 @@
 #include <string>
 #include <thread>
 
+#include "platform/dispatch/FdSource.h"
+#include "platform/dispatch/Semaphore.h"
 #include "platform/dispatch/internal/ThreadPool.h"
 
 namespace platform::dispatch::testing {
@@ -50,6 +52,20 @@ inline int threadsNamed(const std::string& name) {
     if (std::getline(comm, line) && line == name) ++count;
   }
   return count;
+}
+
+// Cancels `source` and returns once its cancel handler has run, that is once
+// no handler of it runs any more; `then` (closing the fd, say) runs in the
+// cancel handler. Answers whether that happened in time.
+inline bool cancelAndWait(const std::shared_ptr<FdSource>& source,
+                          std::function<void()> then = nullptr) {
+  auto done = std::make_shared<Semaphore>();
+  source->setCancelHandler([done, then = std::move(then)] {
+    if (then) then();
+    done->signal();
+  });
+  source->cancel();
+  return done->waitFor(std::chrono::seconds(10)) == WaitResult::Succeeded;
 }
 
 // Changes the pool's limits for one test and puts them back after.
