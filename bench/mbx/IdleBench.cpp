@@ -148,13 +148,13 @@ BENCHMARK(BM_IdleConnections)->Iterations(1)->Unit(benchmark::kMillisecond);
 }  // namespace
 
 int main(int argc, char** argv) {
-  // Each server connection holds its socket and the peer's pidfd.
+  // Each server connection holds one descriptor, its socket.
   rlimit limit{};
   ::getrlimit(RLIMIT_NOFILE, &limit);
   limit.rlim_cur = limit.rlim_max;
   ::setrlimit(RLIMIT_NOFILE, &limit);
   const std::size_t reserve = 64;
-  gConnections = std::min<std::size_t>(kWanted, (limit.rlim_cur - reserve) / 2);
+  gConnections = std::min<std::size_t>(kWanted, limit.rlim_cur - reserve);
   std::printf("RLIMIT_NOFILE %llu: holding %zu connections\n",
               static_cast<unsigned long long>(limit.rlim_cur), gConnections);
 

@@ -131,46 +131,53 @@ dispatch::FdSource::Readiness Connection::onReadable() {
   if (invalidated_) return Readiness::Drained;
   std::uint8_t chunk[ConnectionLimits::kReadChunkBytes];
   for (int reads = 0; reads < limits_.maxReadsPerTurn; ++reads) {
-    if (cancelled_.load(std::memory_order_relaxed)) {
-      invalidate();
-      return Readiness::Drained;
-    }
     ssize_t n = ::recv(fd_, chunk, sizeof chunk, MSG_DONTWAIT);
-    if (n < 0) {
-      const int err = errno;
-      if (err == EINTR) continue;
-      if (err == EAGAIN || err == EWOULDBLOCK) return Readiness::Drained;
-      mbxLog().info("%{public}s: closing: read failed: %{errno}d", description(), err);
-      invalidate();
-      return Readiness::Drained;
-    }
-    if (n == 0) {
-      if (Status ended = reader_.finish(); !ended.ok()) {
-        logBrokenFrame(ended.error());
-      } else {
-        mbxLog().debug("%{public}s: the peer closed the connection", description());
-      }
-      invalidate();
-      return Readiness::Drained;
-    }
-    std::span<const std::uint8_t> input(chunk, static_cast<std::size_t>(n));
-    while (!input.empty()) {
-      Result<std::optional<Frame>> step = reader_.next(input);
-      if (!step.ok()) {
-        logBrokenFrame(step.error());
-        invalidate();
-        return Readiness::Drained;
-      }
-      if (!step.value().has_value()) break;
-      handleFrame(std::move(*step.value()));
-      if (invalidated_) return Readiness::Drained;
-    }
+    const int err = n < 0 ? errno : 0;
+    if (err == EINTR) continue;
+    if (err == EAGAIN || err == EWOULDBLOCK) return Readiness::Drained;
+    if (consumeReceived(n, err, chunk) == Received::Ended) return Readiness::Drained;
     // A short read of a stream socket means it was emptied: whatever comes
     // next is a new arrival, and the source reports it.
     if (static_cast<std::size_t>(n) < sizeof chunk) return Readiness::Drained;
   }
   // Stopped to let other connections have the pool: more may be waiting.
   return Readiness::MayRemain;
+}
+
+Connection::Received Connection::consumeReceived(ssize_t n, int err, const std::uint8_t* bytes) {
+  QV_ASSERT_ON_QUEUE(queue_);
+  if (invalidated_) return Received::Ended;
+  if (cancelled_.load(std::memory_order_relaxed)) {
+    invalidate();
+    return Received::Ended;
+  }
+  if (n < 0) {
+    mbxLog().info("%{public}s: closing: read failed: %{errno}d", description(), err);
+    invalidate();
+    return Received::Ended;
+  }
+  if (n == 0) {
+    if (Status ended = reader_.finish(); !ended.ok()) {
+      logBrokenFrame(ended.error());
+    } else {
+      mbxLog().debug("%{public}s: the peer closed the connection", description());
+    }
+    invalidate();
+    return Received::Ended;
+  }
+  std::span<const std::uint8_t> input(bytes, static_cast<std::size_t>(n));
+  while (!input.empty()) {
+    Result<std::optional<Frame>> step = reader_.next(input);
+    if (!step.ok()) {
+      logBrokenFrame(step.error());
+      invalidate();
+      return Received::Ended;
+    }
+    if (!step.value().has_value()) break;
+    handleFrame(std::move(*step.value()));
+    if (invalidated_) return Received::Ended;
+  }
+  return Received::More;
 }
 
 void Connection::logBrokenFrame(const Error& error) const {

@@ -20,6 +20,8 @@
 // a REQUIRES says otherwise.
 #pragma once
 
+#include <sys/types.h>
+
 #include <atomic>
 #include <cstdint>
 #include <functional>
@@ -119,7 +121,8 @@ class Connection : public std::enable_shared_from_this<Connection> {
 
   Connection(std::string_view serviceName, std::shared_ptr<internal::SocketHandle> socket,
              std::shared_ptr<const PeerIdentity> peer, ConnectionLimits limits);
-  // Wraps a connected non-blocking socket (taking `fd`) in a suspended connection.
+  // Wraps a connected socket (taking `fd`) in a suspended connection. Every read and
+  // write passes MSG_DONTWAIT; only a synchronous waiter blocks, in recv().
   static platform::Result<std::shared_ptr<Connection>> adopt(
       std::string_view serviceName, int fd, std::shared_ptr<const PeerIdentity> peer,
       const ConnectionLimits& limits);
@@ -143,6 +146,11 @@ class Connection : public std::enable_shared_from_this<Connection> {
   // Delivery-queue work. The handlers say whether they went on until EAGAIN.
   dispatch::FdSource::Readiness onReadable();
   dispatch::FdSource::Readiness onWritable();
+  // Takes the outcome of one recv() (`n` bytes, or -1 with `err`): delivers
+  // the frames it completes, or ends the connection at EOF, on an error or on
+  // a broken frame.
+  enum class Received { More, Ended };
+  Received consumeReceived(ssize_t n, int err, const std::uint8_t* bytes);
   void handleFrame(Frame frame);
   void logBrokenFrame(const platform::Error& error) const;
   void invalidate();

@@ -97,20 +97,32 @@ void Connection::readUntilDone(const SyncWaiter& waiter, int fd) {
   // Waits out a delivery that was already running when the reactor was told
   // to stop: it may have taken the reply, or be about to.
   queue_->sync([] {});
+  std::uint8_t chunk[ConnectionLimits::kReadChunkBytes];
   for (;;) {
     if (waiter.done.load(std::memory_order_acquire)) return;
+    ssize_t n;
+    int err = 0;
     {
+      // The socket is in blocking mode (every other call passes
+      // MSG_DONTWAIT), so the wait and the read are one system call.
+      // invalidate() shuts the socket down, which ends this wait too.
+      dispatch::ScopedBlockingCall blocking;
+      do {
+        n = ::recv(fd, chunk, sizeof chunk, 0);
+        err = n < 0 ? errno : 0;
+      } while (err == EINTR);
+    }
+    if (err == EAGAIN || err == EWOULDBLOCK) {
+      // Only a socket left non-blocking gets here: wait for input instead.
       dispatch::ScopedBlockingCall blocking;
       pollfd ready{fd, POLLIN, 0};
-      // invalidate() shuts the socket down, which ends this wait too.
       while (::poll(&ready, 1, -1) < 0 && errno == EINTR) {
       }
+      continue;
     }
     // On the delivery queue (inline when it is idle), so that every event
     // keeps its place in the connection's order.
-    queue_->sync([this, &waiter] {
-      if (!waiter.done.load(std::memory_order_acquire)) (void)onReadable();
-    });
+    queue_->sync([this, n, err, &chunk] { (void)consumeReceived(n, err, chunk); });
   }
 }
 

@@ -96,7 +96,7 @@ void Listener::cancel() {
 void Listener::onAcceptable() {
   for (int accepted = 0; accepted < kMaxAcceptsPerTurn; ++accepted) {
     if (cancelled_.load(std::memory_order_relaxed)) return;
-    int fd = ::accept4(fd_, nullptr, nullptr, SOCK_NONBLOCK | SOCK_CLOEXEC);
+    int fd = ::accept4(fd_, nullptr, nullptr, SOCK_CLOEXEC);
     if (fd < 0) {
       const int err = errno;
       if (err == EINTR || err == ECONNABORTED) continue;

@@ -1,7 +1,7 @@
 #include "platform/mbx/identity/PeerIdentity.h"
 
 #include "platform/mbx/identity/internal/IdentityTaker.h"
-#include "platform/mbx/identity/internal/Pidfd.h"
+#include "platform/mbx/identity/internal/ProcDir.h"
 
 namespace platform::mbx {
 
@@ -19,7 +19,11 @@ Result<std::shared_ptr<const PeerIdentity>> PeerIdentity::fromSocketForTesting(
 }
 
 bool PeerIdentity::isAlive() const {
-  return internal::livenessOf(pidfd_.get()) == internal::Liveness::Alive;
+  Result<internal::ProcDir> dir = internal::ProcDir::open(pid_);
+  if (!dir) return false;
+  Result<internal::ProcStat> stat = dir->readStat();
+  if (!stat) return false;
+  return stat->startTime == startTime_ && stat->state != 'Z' && stat->state != 'X';
 }
 
 std::string PeerIdentity::description() const {

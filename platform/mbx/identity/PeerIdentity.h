@@ -27,7 +27,6 @@
 
 #include "platform/mbx/identity/Confinement.h"
 #include "platform/mbx/identity/IdentityTestHooks.h"
-#include "platform/mbx/identity/internal/UniqueFd.h"
 #include "platform/values/Result.h"
 
 namespace platform::mbx {
@@ -82,11 +81,12 @@ class PeerIdentity {
     return confinement_.isSandboxedRelativeTo(daemon.confinement_);
   }
 
-  // True while the process is still running. Never blocks.
+  // True while the process is still running: /proc/<pid> exists, is not a
+  // zombie, and shows the start time taken at accept, so a process that
+  // later got the same pid is never taken for the peer. Never blocks. The
+  // identity holds no descriptor, so that a daemon with many clients pays
+  // one descriptor (the socket) per connection.
   bool isAlive() const;
-  // The pidfd, e.g. to watch for the peer's exit; it becomes readable then.
-  // Borrowed: owned and closed by this identity.
-  int pidfd() const { return pidfd_.get(); }
 
   // "pid 123 (uid 0) /usr/bin/x", with " (replaced)" after a replaced
   // executable.
@@ -105,7 +105,6 @@ class PeerIdentity {
   ino_t executableInode_ = 0;
   bool executableWasReplaced_ = false;
   Confinement confinement_;
-  internal::UniqueFd pidfd_;
 };
 
 }  // namespace platform::mbx

@@ -151,12 +151,8 @@ Result<int> connectTo(const std::string& path) {
     }
     return socketError(err, "connect", path);
   }
-  int flags = ::fcntl(fd, F_GETFL);
-  if (flags < 0 || ::fcntl(fd, F_SETFL, flags | O_NONBLOCK) != 0) {
-    err = errno;
-    ::close(fd);
-    return socketError(err, "fcntl", path);
-  }
+  // Left in blocking mode: every read and write passes MSG_DONTWAIT, except
+  // a synchronous request's wait for its reply, which blocks in recv().
   return fd;
 }
 

@@ -165,7 +165,6 @@ IdentityTaker::Taken IdentityTaker::take(Subject subject, const IdentityTestHook
   identity->confinement_.noNewPrivs = status->noNewPrivs;
   identity->confinement_.securityLabel = std::move(*subject.securityLabel);
   identity->confinement_.mountNamespace = *mountNamespace;
-  identity->pidfd_ = std::move(pidfd);
   return std::shared_ptr<const PeerIdentity>(std::move(identity));
 }
 
