@@ -51,6 +51,8 @@ enum QVDiscoverFlags : std::uint64_t {
   QVDiscoverKeepDuplicates = 0x4,
   QVDiscoverSystemOnly = 0x8,
   QVDiscoverAll = 0x200,
+  // Client side only: the client library sends the request synchronously.
+  QVDiscoverSynchronous = 0x400,
 };
 
 // Posted after annotation and hold changes.

@@ -1,0 +1,38 @@
+// The platform services the daemon reaches, handed to the server at
+// construction as one bundle so that tests can replace any of them with a
+// fake. The daemon never reaches a platform service through a global.
+//
+// Thread safety: a plain value; the services it holds are safe to call from
+// any thread.
+#pragma once
+
+#include <memory>
+
+#include "platform/codesign/EntitlementStore.h"
+#include "platform/container/ContainerManager.h"
+#include "platform/notify/NotificationCenter.h"
+#include "platform/prefs/PreferenceStore.h"
+#include "platform/sandbox/SandboxCheck.h"
+#include "platform/values/Result.h"
+
+namespace qvd {
+
+struct Platform {
+  std::shared_ptr<const platform::codesign::EntitlementStore> entitlements;
+  std::shared_ptr<const platform::sandbox::SandboxCheck> sandbox;
+  std::shared_ptr<const platform::prefs::PreferenceStore> preferences;
+  std::shared_ptr<platform::notify::NotificationCenter> notifications;
+  std::shared_ptr<platform::container::ContainerManager> containers;
+
+  // The Linux implementations, all under the platform root. Fails when this
+  // process's own identity (which the sandbox check compares peers with)
+  // cannot be taken.
+  static platform::Result<Platform> linuxPlatform();
+
+  // True when every service is present.
+  bool complete() const {
+    return entitlements && sandbox && preferences && notifications && containers;
+  }
+};
+
+}  // namespace qvd

@@ -1,0 +1,121 @@
+// The daemon's one server: the plug-in database extended with the service
+// that clients reach: the listener on the service name, the queues requests
+// run on, the SIGTERM handler, the preferences object and the hold list.
+//
+//   queue "mbx"         listener events and client creation
+//   queue "service"     every request's dispatch, one at a time in arrival
+//                       order (user-initiated priority)
+//   queue "serverSync"  every read and change of the hold list
+//
+// Thread safety: the accessors and submitWork() are safe from any queue;
+// the hold list is confined to the hold queue, and code already running on
+// that queue must not wait on it.
+#pragma once
+
+#include <functional>
+#include <memory>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "platform/dispatch/SerialQueue.h"
+#include "platform/dispatch/SignalSource.h"
+#include "platform/mbx/Listener.h"
+#include "qvd/Platform.h"
+#include "qvd/QVDPlugInHold.h"
+#include "qvd/QVDUserPrefs.h"
+#include "qvd/QVDatabase.h"
+
+namespace qvd {
+
+class QVDMbxClient;
+
+enum class Submission { Asynchronous, Synchronous };
+// Whether the server takes SIGTERM (the daemon does; a test that builds a
+// server in process does not).
+enum class TerminationSignal { Watched, NotWatched };
+
+class QVDServer final : public QVDatabase, public std::enable_shared_from_this<QVDServer> {
+ public:
+  // Builds the server: the database part, the queues, the listener (not yet
+  // resumed), the hold list, the process-wide instance, the preferences and
+  // the SIGTERM source on the main queue. None (with the reason logged) when
+  // any part cannot be made.
+  // REQUIRES: platform.complete(); called on the main thread, before other
+  //           threads of the caller's own exist (so that SIGTERM stays
+  //           blocked everywhere but in the signal source).
+  static std::shared_ptr<QVDServer> initForService(std::string serviceName,
+                                                   std::optional<std::string> databasePath,
+                                                   Platform platform,
+                                                   TerminationSignal signal = TerminationSignal::Watched);
+
+  // The server made by initForService(); none before.
+  static std::shared_ptr<QVDServer> server();
+
+  // Resumes the listener and serves the main queue until the process ends.
+  // REQUIRES: the main thread.
+  [[noreturn]] void run();
+  // Resumes the listener only; for callers that run the main loop themselves.
+  void resumeForTesting();
+
+  // Cancels the listener and releases every hold, then posts one
+  // annotation-change notification (also when there were no holds). Waits
+  // on the hold queue.
+  // REQUIRES: not on the hold queue.
+  void stop();
+
+  // Queues `work` on the service queue. Synchronous: logs so and runs it
+  // there, returning once it has finished.
+  // REQUIRES for Synchronous: not on the service queue.
+  void submitWork(std::function<void()> work, Submission submission);
+
+  // Releases every hold `client` took. Returns at once; the list changes on
+  // the hold queue.
+  void unholdClient(const std::shared_ptr<QVDMbxClient>& client);
+  // Adds a hold to the list (on the hold queue; returns at once).
+  void addHold(std::shared_ptr<const QVDPlugInHold> hold);
+  // The holds as they are now (waits on the hold queue).
+  // REQUIRES: not on the hold queue.
+  std::vector<std::shared_ptr<const QVDPlugInHold>> holds() const;
+
+  const std::string& serviceName() const { return serviceName_; }
+  const Platform& platform() const { return platform_; }
+  const QVDUserPrefs& userPrefs() const { return *userPrefs_; }
+  const std::shared_ptr<platform::dispatch::SerialQueue>& mbxQueue() const { return mbxQueue_; }
+  const std::shared_ptr<platform::dispatch::SerialQueue>& mainQueue() const { return mainQueue_; }
+  const std::shared_ptr<platform::dispatch::SerialQueue>& holdQueue() const { return syncQueue_; }
+
+  // What the SIGTERM handler does after stop(): by default it ends the
+  // process with status 0.
+  void setTerminationActionForTesting(std::function<void()> action);
+  // Forgets the process-wide instance so that a test can build another.
+  static void resetForTesting();
+  // Tells the client observer (if any) of a client about to be resumed.
+  // REQUIRES: on the listener queue.
+  void noteNewClient(const std::shared_ptr<QVDMbxClient>& client);
+  // Runs `observer` on the listener queue with every client made, before
+  // its first event.
+  void setClientObserverForTesting(std::function<void(std::shared_ptr<QVDMbxClient>)> observer);
+
+  QVDServer(std::string serviceName, Platform platform);  // use initForService()
+  ~QVDServer() override;
+
+ private:
+  void handleListenerEvent(const platform::mbx::Listener::Event& event);
+  void terminate();
+
+  const std::string serviceName_;
+  const Platform platform_;
+  const std::shared_ptr<platform::dispatch::SerialQueue> mbxQueue_;
+  const std::shared_ptr<platform::dispatch::SerialQueue> mainQueue_;
+  const std::shared_ptr<platform::dispatch::SerialQueue> syncQueue_;
+  std::shared_ptr<platform::mbx::Listener> service_;
+  std::unique_ptr<QVDUserPrefs> userPrefs_;
+  std::shared_ptr<platform::dispatch::SignalSource> sigSource_;
+  std::function<void()> terminationAction_;  // set before the source is resumed
+  std::function<void(std::shared_ptr<QVDMbxClient>)> clientObserver_;  // set before resume
+  // Touched only on syncQueue_.
+  std::vector<std::shared_ptr<const QVDPlugInHold>> holds_;
+};
+
+}  // namespace qvd

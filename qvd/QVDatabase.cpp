@@ -1,0 +1,47 @@
+#include "qvd/QVDatabase.h"
+
+#include "Quorvex/QVFileURL.h"
+#include "Quorvex/QVLog.h"
+
+namespace qvd {
+
+QVDatabase::QVDatabase() : sync_(platform::dispatch::SerialQueue::create("QVDatabase")) {}
+
+QVDatabase::~QVDatabase() = default;
+
+platform::Status QVDatabase::initDatabase(std::optional<std::string> databasePath) {
+  databasePath_ = std::move(databasePath);
+  return platform::Status();
+}
+
+std::shared_ptr<const QVDPlugIn> QVDatabase::findPlugIn(const platform::Uuid& uuid) {
+  std::shared_ptr<const QVDPlugIn> found;
+  sync_->sync([&] {
+    auto it = byUuid_.find(uuid.toString());
+    if (it != byUuid_.end()) found = it->second;
+  });
+  return found;
+}
+
+std::shared_ptr<const QVDPlugIn> QVDatabase::findPlugInAtPath(std::string_view url) {
+  std::optional<std::string> path = QVPathFromFileURL(url);
+  if (!path) {
+    QVLogTraffic().info("not a file URL: %{public}s", std::string(url));
+    return nullptr;
+  }
+  std::shared_ptr<const QVDPlugIn> found;
+  sync_->sync([&] {
+    auto it = byPath_.find(*path);
+    if (it != byPath_.end()) found = it->second;
+  });
+  return found;
+}
+
+void QVDatabase::addPlugInForTesting(std::shared_ptr<const QVDPlugIn> plugIn) {
+  sync_->sync([&] {
+    byUuid_[plugIn->uuid().toString()] = plugIn;
+    byPath_[plugIn->path()] = plugIn;
+  });
+}
+
+}  // namespace qvd

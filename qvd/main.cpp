@@ -1,0 +1,40 @@
+// qvd: the plug-in registry daemon. Serves until SIGTERM.
+#include <cstdio>
+#include <string>
+#include <vector>
+
+#include "Quorvex/QVLog.h"
+#include "platform/log/LoggerRegistry.h"
+#include "qvd/Platform.h"
+#include "qvd/QVDOptions.h"
+#include "qvd/QVDServer.h"
+
+int main(int argc, char** argv) {
+  QVLogOps().info("qvd is launching");
+  std::optional<qvd::QVDOptions> options =
+      qvd::parseOptions(std::vector<std::string>(argv, argv + argc));
+  if (!options) {
+    std::fprintf(stderr, "%s\n", qvd::kUsageLine);
+    return 2;
+  }
+  for (int i = 0; i < options->verboseCount; ++i) {
+    platform::log::defaultLog().error(
+        "verbose option -v is ineffective; use log config --subsystem com.corvane.quorvex");
+  }
+  platform::Result<qvd::Platform> services = qvd::Platform::linuxPlatform();
+  std::shared_ptr<qvd::QVDServer> server;
+  if (services.ok()) {
+    server = qvd::QVDServer::initForService(options->serviceName, options->databasePath,
+                                            std::move(services).value());
+  } else {
+    QVLogOps().error("the platform services are unavailable: %@", services.error());
+  }
+  if (!server) {
+    QVLogOps().error("unable to construct server");
+    return 1;
+  }
+  server->setCacheLimit(options->cacheLimit);
+  QVLogOps().info("serving %{public}s with a plug-in cache limit of %llu", options->serviceName,
+                  static_cast<unsigned long long>(server->cacheLimit()));
+  server->run();
+}

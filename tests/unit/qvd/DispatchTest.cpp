@@ -1,0 +1,291 @@
+// Request envelopes and dispatch through a server in this process, over real
+// connections: version and name checks, the order of checks, requests of a
+// client that has died, synchronous submission, and finishing exactly once.
+#include <gtest/gtest.h>
+
+#include <future>
+
+#include "Quorvex/QVDConstants.h"
+#include "Quorvex/QVErrors.h"
+#include "platform/log/LogCaptureForTesting.h"
+#include "platform/log/LoggerRegistry.h"
+#include "qvd/Transaction.h"
+#include "tests/unit/qvd/QvdTestSupport.h"
+
+namespace qvd::testing {
+namespace {
+
+using platform::Dictionary;
+using platform::Value;
+
+class DispatchTest : public ::testing::Test {
+ protected:
+  void TearDown() override { Transaction::removeRequestsForTesting(); }
+  TestServer server_;
+};
+
+TEST_F(DispatchTest, EnvelopeErrors) {
+  struct Case {
+    const char* what;
+    Dictionary request;
+    ErrorReply expected;
+  };
+  auto withVersion = [](Value version) {
+    Dictionary d = request("match");
+    d.set(QVDVersionKey, std::move(version));
+    return d;
+  };
+  auto withName = [](Value name) {
+    Dictionary d = request("x");
+    d.set(QVDRequestKey, std::move(name));
+    return d;
+  };
+  const std::vector<Case> cases = {
+      {"version 1", withVersion(1), {7, "unsupported protocol version 1 (current 3)"}},
+      {"version 4", withVersion(4), {7, "unsupported protocol version 4 (current 3)"}},
+      {"no version", withVersion(Value()), {7, "unsupported protocol version 0 (current 3)"}},
+      {"version as text", withVersion("3"), {7, "unsupported protocol version 0 (current 3)"}},
+      {"version as boolean", withVersion(true), {7, "unsupported protocol version 0 (current 3)"}},
+      {"negative version", withVersion(-3), {7, "unsupported protocol version 0 (current 3)"}},
+      {"no name", withName(Value()), {4, "invalid request format (missing type)"}},
+      {"name not text", withName(42), {4, "invalid request format (missing type)"}},
+      {"unknown name", withName("frobnicate"), {4, "unrecognized request"}},
+      {"names are case-sensitive", withName("Match"), {4, "unrecognized request"}},
+      {"version 2 is accepted", [&] {
+         Dictionary d = withName("nope");
+         d.set(QVDVersionKey, 2);
+         return d;
+       }(), {4, "unrecognized request"}},
+  };
+  TestClient client(server_);
+  for (const Case& c : cases) {
+    auto reply = client.call(c.request);
+    ASSERT_TRUE(reply.ok()) << c.what;
+    EXPECT_EQ(errorOf(*reply), c.expected) << c.what;
+    EXPECT_EQ(reply->dictionary()->size(), 2u) << c.what << ": only the error keys";
+  }
+  // Every table name reaches its handler; until they are served they are
+  // refused exactly as an unknown name is.
+  for (auto name : {QVDAddRequest, QVDRemoveRequest, QVDBulkRequest, QVDMatchRequest,
+                    QVDReadyRequest, QVDAccessRequest, QVDAnnotateRequest, QVDBulkAnnotateRequest,
+                    QVDLockdownRequest, QVDFindRequest}) {
+    auto reply = client.call(request(name));
+    ASSERT_TRUE(reply.ok());
+    EXPECT_EQ(errorOf(*reply), (ErrorReply{4, "unrecognized request"})) << name;
+  }
+}
+
+TEST_F(DispatchTest, TableNamesCannotBeTakenOverAndTestRoutesAnswer) {
+  int calls = 0;
+  Transaction::addRequestForTesting("match", [&](Transaction& t) {
+    ++calls;
+    t.done();
+  });
+  Transaction::addRequestForTesting("echo", [](Transaction& t) {
+    t.reply().set("echo", t.request().get("payload"));
+    t.reply().set("version", t.version());
+    t.done();
+  });
+  TestClient client(server_);
+  Dictionary echo = request("echo");
+  echo.set("payload", Dictionary{{"nested", platform::Array{1, "two"}}});
+  auto reply = client.call(echo);
+  ASSERT_TRUE(reply.ok());
+  EXPECT_EQ(reply->dictionary()->get("echo"), echo.get("payload"));
+  EXPECT_EQ(reply->dictionary()->get("version"), Value(3));
+  EXPECT_EQ(errorOf(client.call(request("match")).value()).code, 4u);
+  EXPECT_EQ(calls, 0);
+}
+
+TEST_F(DispatchTest, MessageThatIsNotADictionaryIsLoggedAndTheConnectionStaysOpen) {
+  platform::log::LogCaptureForTesting capture;
+  TestClient client(server_);
+  client.connection()->sendWithReply(Value(platform::Array{"not", "a", "request"}),
+                                     platform::dispatch::SerialQueue::create("t"),
+                                     [](platform::Result<platform::mbx::Message> reply) {
+                                       // Only the connection's end completes it.
+                                       EXPECT_FALSE(reply.ok()) << "a message that is no request was answered";
+                                     });
+  // Delivered in order: once this is answered, the array has been handled.
+  auto reply = client.call(request("nope"));
+  ASSERT_TRUE(reply.ok());
+  EXPECT_EQ(errorOf(*reply).code, 4u);
+  bool logged = false;
+  for (const auto& line : capture.messages()) {
+    logged |= line.find("unexpected message: ") == 0 && line.find(" from: ") != std::string::npos;
+  }
+  EXPECT_TRUE(logged);
+}
+
+// Holds the service queue inside a handler until released, so that requests
+// queue up behind it.
+class ServiceQueueBlocker {
+ public:
+  ServiceQueueBlocker() {
+    Transaction::addRequestForTesting("block", [this](Transaction& t) {
+      entered_.set_value();
+      release_.get_future().wait();
+      t.done();
+    });
+  }
+  void waitUntilBlocked() { entered_.get_future().wait(); }
+  void release() { release_.set_value(); }
+
+ private:
+  std::promise<void> entered_;
+  std::promise<void> release_;
+};
+
+TEST_F(DispatchTest, QueuedRequestOfADeadClientIsDroppedUnlessItWasSynchronous) {
+  for (bool synchronous : {false, true}) {
+    SCOPED_TRACE(synchronous ? "sync" : "async");
+    ServiceQueueBlocker blocker;
+    std::atomic<int> handled{0};
+    Transaction::addRequestForTesting("count", [&](Transaction& t) {
+      ++handled;
+      t.done();
+    });
+    TestClient holder(server_);
+    holder.callAsync(request("block"));
+    blocker.waitUntilBlocked();
+
+    const std::size_t before = server_.clients().size();
+    TestClient dying(server_);
+    Dictionary counted = request("count");
+    if (synchronous) counted.set(QVDSynchronousRequestKey, true);
+    dying.callAsync(counted);
+    ASSERT_TRUE(eventually([&] { return server_.clients().size() == before + 1; }));
+    std::shared_ptr<QVDMbxClient> client = server_.clients().back();
+    dying.cancel();
+    if (!synchronous) {
+      // The death clears the client's flag while its request still waits.
+      ASSERT_TRUE(eventually([&] { return !client->acceptWork(); }));
+    } else {
+      // The death waits behind the synchronous request.
+      std::this_thread::sleep_for(50ms);
+      EXPECT_TRUE(client->acceptWork());
+    }
+    blocker.release();
+    ASSERT_TRUE(eventually([&] { return holder.asyncReplyCount() == 1; }));
+    // Anything queued after the blocker has run once this answers.
+    TestClient probe(server_);
+    ASSERT_TRUE(probe.call(request("nope")).ok());
+    EXPECT_EQ(handled.load(), synchronous ? 1 : 0);
+    ASSERT_TRUE(eventually([&] { return !client->acceptWork(); }));
+    Transaction::removeRequestsForTesting();
+  }
+}
+
+TEST_F(DispatchTest, ADeadClientGetsOnlyVersionErrors) {
+  // The version check comes before the client's state. Mark the client dead
+  // while its connection still carries requests.
+  int handled = 0;
+  Transaction::addRequestForTesting("count", [&](Transaction& t) {
+    ++handled;
+    t.done();
+  });
+  TestClient client(server_);
+  ASSERT_TRUE(client.call(request("nope")).ok());
+  server_.clients().back()->dead();
+  client.callAsync(request("count"));
+  Dictionary old = request("count");
+  old.set(QVDVersionKey, 1);
+  auto reply = client.call(old);
+  ASSERT_TRUE(reply.ok());
+  EXPECT_EQ(errorOf(*reply).code, 7u);
+  // Dispatched in order: the earlier request was dropped without a reply.
+  EXPECT_EQ(client.asyncReplyCount(), 0u);
+  EXPECT_EQ(handled, 0);
+}
+
+TEST_F(DispatchTest, EveryThousandthRequestOfAClientIsLogged) {
+  platform::log::LoggerRegistry::shared().applyFilterForTesting("debug");
+  platform::log::LogCaptureForTesting capture;
+  TestClient client(server_);
+  for (int i = 0; i < 999; ++i) client.callAsync(request("nope"));
+  ASSERT_TRUE(eventually([&] { return client.asyncReplyCount() == 999; }))
+      << client.asyncReplyCount() << " replies; last "
+      << (client.asyncReplies().back().ok() ? client.asyncReplies().back()->description()
+                                            : client.asyncReplies().back().error().description());
+  auto countLines = [&] {
+    int n = 0;
+    for (const auto& line : capture.messages()) {
+      if (line.find("requests so far") != std::string::npos) {
+        EXPECT_NE(line.find(" used 1000 requests so far"), std::string::npos) << line;
+        ++n;
+      }
+    }
+    return n;
+  };
+  EXPECT_EQ(countLines(), 0);
+  ASSERT_TRUE(client.call(request("nope")).ok());
+  EXPECT_EQ(countLines(), 1);
+  platform::log::LoggerRegistry::shared().applyFilterForTesting("");
+}
+
+TEST_F(DispatchTest, FinishingTwiceSendsOneReplyAndADeferredReplyToAGoneClientIsDropped) {
+  std::shared_ptr<Transaction> kept;
+  std::promise<void> deferred;
+  Transaction::addRequestForTesting("twice", [](Transaction& t) {
+    t.reply().set("first", true);
+    t.done();
+    t.failMessage(4, "too late");
+    t.done();
+  });
+  Transaction::addRequestForTesting("defer", [&](Transaction& t) {
+    kept = t.shared_from_this();
+    deferred.set_value();
+  });
+  platform::log::LogCaptureForTesting capture;
+  {
+    TestClient client(server_);
+    auto reply = client.call(request("twice"));
+    ASSERT_TRUE(reply.ok());
+    EXPECT_EQ(reply->dictionary()->get("first"), Value(true));
+    EXPECT_EQ(errorOf(*reply).code, 0u);
+    // The next reply on the connection answers the next request, so a
+    // stray second reply would have been taken as this one's.
+    auto next = client.call(request("nope"));
+    ASSERT_TRUE(next.ok());
+    EXPECT_EQ(errorOf(*next), (ErrorReply{4, "unrecognized request"}));
+
+    client.callAsync(request("defer"));
+    deferred.get_future().wait();
+  }
+  // The client has gone; finishing now must do no harm.
+  ASSERT_TRUE(kept);
+  ASSERT_TRUE(eventually([&] { return !kept->client()->acceptWork(); }));
+  kept->failMessage(4, "answered late");
+  EXPECT_TRUE(kept->finished());
+  int refused = 0;
+  for (const auto& line : capture.messages()) {
+    refused += line.find("was refused") != std::string::npos ||
+               line.find("failed after its reply") != std::string::npos;
+  }
+  EXPECT_EQ(refused, 2);
+}
+
+TEST_F(DispatchTest, FailErrorUsesTheOwnDomainsCodeAndTheGivenCodeOtherwise) {
+  struct Case {
+    platform::Error error;
+    ErrorReply expected;
+  };
+  const std::vector<Case> cases = {
+      {QVErrorWithCodeMessage(QVErrorBadPath, "no such file"), {9, "no such file"}},
+      {QVErrorWithCodeMessage(QVErrorDenied, std::nullopt), {11, "QVErrorDenied"}},
+      {platform::Error("POSIX", 2, "No such file or directory"), {2, "No such file or directory"}},
+  };
+  std::size_t next = 0;
+  Transaction::addRequestForTesting("fail", [&](Transaction& t) {
+    t.failError(2, cases[next].error);
+  });
+  TestClient client(server_);
+  for (; next < cases.size(); ++next) {
+    auto reply = client.call(request("fail"));
+    ASSERT_TRUE(reply.ok());
+    EXPECT_EQ(errorOf(*reply), cases[next].expected) << cases[next].error.description();
+  }
+}
+
+}  // namespace
+}  // namespace qvd::testing

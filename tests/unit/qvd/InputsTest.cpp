@@ -1,0 +1,147 @@
+// The shared request inputs, driven over real connections through requests
+// that tests register: "paths" read and resolved on the file system, and
+// "uuids" resolved to plug-ins, by path when a UUID is unknown.
+#include <gtest/gtest.h>
+#include <unistd.h>
+
+#include <filesystem>
+#include <fstream>
+
+#include "Quorvex/QVDConstants.h"
+#include "platform/root/Root.h"
+#include "qvd/Transaction.h"
+#include "tests/unit/qvd/QvdTestSupport.h"
+
+namespace qvd::testing {
+namespace {
+
+using platform::Array;
+using platform::Dictionary;
+using platform::Uuid;
+using platform::Value;
+
+class InputsTest : public ::testing::Test {
+ protected:
+  void SetUp() override {
+    // "paths": each element the callback saw, as [path, resolved].
+    Transaction::addRequestForTesting("paths", [](Transaction& t) {
+      auto seen = std::make_shared<Array>();
+      auto transaction = t.shared_from_this();
+      t.processPaths([seen, transaction](const std::string& path, PathResolution resolution) {
+        seen->append(Array{path, resolution == PathResolution::Resolved});
+        transaction->reply().set("seen", *seen);
+        return true;
+      });
+    });
+    // "uuids": the plug-ins found, by path.
+    Transaction::addRequestForTesting("uuids", [](Transaction& t) {
+      Array found;
+      if (t.processUuidList([&](const std::shared_ptr<const QVDPlugIn>& plugIn) {
+            found.append(plugIn->path());
+            return true;
+          })) {
+        t.reply().set("found", found);
+        t.done();
+      }
+    });
+    dir_ = platform::rootPath("inputs-" + std::to_string(::getpid()));
+    std::filesystem::create_directories(dir_ + "/real");
+    std::ofstream(dir_ + "/real/file") << "x";
+    std::filesystem::create_symlink(dir_ + "/real", dir_ + "/link");
+  }
+  void TearDown() override {
+    Transaction::removeRequestsForTesting();
+    std::filesystem::remove_all(dir_);
+  }
+
+  Value call(Dictionary request) {
+    TestClient client(server_);
+    auto reply = client.call(request);
+    EXPECT_TRUE(reply.ok());
+    return reply.ok() ? *reply : Value();
+  }
+
+  TestServer server_;
+  std::string dir_;
+};
+
+TEST_F(InputsTest, Paths) {
+  const std::string real = std::filesystem::canonical(dir_ + "/real").string();
+  struct Case {
+    const char* what;
+    Value paths;
+    Value seen;  // none: nothing reached the callback
+    ErrorReply error;
+  };
+  const std::vector<Case> cases = {
+      {"a single text is not a list", Value(dir_), Value(), {4, "invalid request format"}},
+      {"absent", Value(), Value(), {4, "invalid request format"}},
+      {"an element not text", Array{dir_, 7}, Array{Array{dir_, true}},
+       {4, "invalid request format"}},
+      {"relative after absolute", Array{dir_ + "/real", "rel/x"}, Array{Array{real, true}},
+       {9, "absolute path required: rel/x"}},
+      {"empty text", Array{""}, Value(), {9, "absolute path required: "}},
+      {"missing path handed on unresolved", Array{dir_ + "/nothing/here"},
+       Array{Array{dir_ + "/nothing/here", false}}, {}},
+      {"link resolved to its target", Array{dir_ + "/link/file"},
+       Array{Array{real + "/file", true}}, {}},
+      {"dot segments resolved", Array{dir_ + "/real/../real/./file"},
+       Array{Array{real + "/file", true}}, {}},
+      {"empty list passes", Array{}, Value(), {}},
+  };
+  for (const Case& c : cases) {
+    Dictionary r = request("paths");
+    r.set(QVDPathsKey, c.paths);
+    Value reply = call(r);
+    EXPECT_EQ(errorOf(reply), c.error) << c.what;
+    EXPECT_EQ(reply.dictionary()->get("seen"), c.seen) << c.what;
+  }
+}
+
+TEST_F(InputsTest, Uuids) {
+  const Uuid known = Uuid::generate();
+  const Uuid unknown = Uuid::generate();
+  server_.server()->addPlugInForTesting(std::make_shared<QVDPlugIn>(known, "/System/Known.ovx"));
+  const Uuid byPath = Uuid::generate();
+  server_.server()->addPlugInForTesting(std::make_shared<QVDPlugIn>(byPath, "/System/ByPath.ovx"));
+  struct Case {
+    const char* what;
+    Value uuids;
+    Value paths;
+    Value found;
+    ErrorReply error;
+  };
+  const std::vector<Case> cases = {
+      {"absent", Value(), Value(), Value(), {4, "invalid request format (uuid)"}},
+      {"one UUID, not a list", Value(known), Value(), Value(), {4, "invalid request format (uuid)"}},
+      {"an element not a UUID", Array{known, known.toString()}, Value(), Value(),
+       {4, "invalid request (bad uuid array)"}},
+      {"unknown without paths", Array{unknown}, Value(), Value(),
+       {4, "no such plugin (uuid not found)"}},
+      {"empty list", Array{}, Value(), Array{}, {}},
+      {"known", Array{known, known}, Value(), Array{"/System/Known.ovx", "/System/Known.ovx"}, {}},
+      {"unknown found by its parallel path", Array{known, unknown},
+       Array{"/System/Known.ovx", "/System/ByPath.ovx"},
+       Array{"/System/Known.ovx", "/System/ByPath.ovx"}, {}},
+      {"paths of another length are ignored", Array{known, unknown, known},
+       Array{"/System/ByPath.ovx", "/System/ByPath.ovx"}, Value(),
+       {4, "no such plugin (uuid not found)"}},
+      {"paths that are no list are ignored", Array{unknown}, Value("/System/ByPath.ovx"), Value(),
+       {4, "no such plugin (uuid not found)"}},
+      {"a parallel path that is no text", Array{unknown}, Array{7}, Value(),
+       {4, "no such plugin (uuid not found)"}},
+      {"a relative parallel path finds nothing", Array{unknown}, Array{"System/ByPath.ovx"},
+       Value(), {4, "no such plugin (uuid not found)"}},
+  };
+  for (const Case& c : cases) {
+    Dictionary r = request("uuids");
+    r.set(QVDUUIDKey, c.uuids);
+    r.set(QVDPathsKey, c.paths);
+    Value reply = call(r);
+    EXPECT_EQ(errorOf(reply), c.error) << c.what;
+    EXPECT_EQ(reply.dictionary()->get("found"), c.found) << c.what;
+  }
+}
+
+}  // namespace
+}  // namespace qvd::testing

@@ -1,0 +1,134 @@
+#include "tests/unit/qvd/QvdTestSupport.h"
+
+#include <stdlib.h>
+
+#include <thread>
+
+#include "Quorvex/QVDConstants.h"
+#include "platform/root/Root.h"
+
+namespace qvd::testing {
+
+namespace {
+
+// One root for the whole test process: the root may only change while no
+// other thread reads it, and the dispatch pool's threads outlive each test.
+const std::string& processRoot() {
+  static const std::string root = [] {
+    char pattern[] = "/tmp/qvd-test-XXXXXX";
+    const char* made = ::mkdtemp(pattern);
+    std::string path = made != nullptr ? made : "/tmp";
+    platform::setRootDirectoryForTesting(path);
+    ::setenv("QV_ROOT", path.c_str(), 1);
+    return path;
+  }();
+  return root;
+}
+
+std::atomic<int> gServerSerial{0};
+
+}  // namespace
+
+Platform FakePlatform::platform() const {
+  Platform services;
+  services.entitlements = entitlements;
+  services.sandbox = sandbox;
+  services.preferences = preferences;
+  services.notifications = notifications;
+  services.containers = containers;
+  return services;
+}
+
+bool eventually(const std::function<bool()>& done, std::chrono::milliseconds limit) {
+  const auto deadline = std::chrono::steady_clock::now() + limit;
+  while (!done()) {
+    if (std::chrono::steady_clock::now() > deadline) return false;
+    std::this_thread::sleep_for(2ms);
+  }
+  return true;
+}
+
+TestServer::TestServer() {
+  (void)processRoot();
+  serviceName_ = "qvd.test." + std::to_string(::getpid()) + "." + std::to_string(++gServerSerial);
+  server_ = QVDServer::initForService(serviceName_, std::nullopt, fakes_.platform(),
+                                      TerminationSignal::NotWatched);
+  if (!server_) return;
+  server_->setClientObserverForTesting([this](std::shared_ptr<QVDMbxClient> client) {
+    std::lock_guard<std::mutex> lock(mu_);
+    clients_.push_back(std::move(client));
+  });
+  server_->resumeForTesting();
+}
+
+TestServer::~TestServer() {
+  if (server_) server_->stop();
+  QVDServer::resetForTesting();
+}
+
+std::vector<std::shared_ptr<QVDMbxClient>> TestServer::clients() const {
+  std::lock_guard<std::mutex> lock(mu_);
+  return clients_;
+}
+
+TestClient::TestClient(const TestServer& server)
+    : replyQueue_(platform::dispatch::SerialQueue::create("test.replies")) {
+  auto connection = platform::mbx::Connection::connectToService(server.serviceName());
+  if (!connection.ok()) return;
+  connection_ = std::move(connection).value();
+  connection_->setEventHandler([](const platform::mbx::ConnectionEvent&) {});
+  connection_->resume();
+}
+
+TestClient::~TestClient() {
+  if (connection_) connection_->cancel();
+}
+
+platform::Result<platform::Value> TestClient::call(const platform::Dictionary& request) {
+  if (!connection_) return platform::Error("test", 1, "not connected");
+  auto reply = connection_->sendWithReplySync(platform::Value(request));
+  if (!reply.ok()) return reply.error();
+  return reply->body();
+}
+
+void TestClient::callAsync(const platform::Dictionary& request) {
+  // The handler may outlive this object (the connection's end completes
+  // what is still awaited), so it writes to state it shares.
+  connection_->sendWithReply(platform::Value(request), replyQueue_,
+                             [replies = replies_](platform::Result<platform::mbx::Message> reply) {
+                               std::lock_guard<std::mutex> lock(replies->mu);
+                               if (reply.ok()) {
+                                 replies->list.emplace_back(reply->body());
+                               } else {
+                                 replies->list.emplace_back(reply.error());
+                               }
+                             });
+}
+
+std::vector<platform::Result<platform::Value>> TestClient::asyncReplies() const {
+  std::lock_guard<std::mutex> lock(replies_->mu);
+  return replies_->list;
+}
+
+std::size_t TestClient::asyncReplyCount() const {
+  std::lock_guard<std::mutex> lock(replies_->mu);
+  return replies_->list.size();
+}
+
+platform::Dictionary request(std::string_view name) {
+  platform::Dictionary message;
+  message.set(QVDRequestKey, std::string(name));
+  message.set(QVDVersionKey, QVDProtocolVersion);
+  return message;
+}
+
+ErrorReply errorOf(const platform::Value& reply) {
+  ErrorReply error;
+  const platform::Dictionary* body = reply.dictionary();
+  if (body == nullptr) return {~0ull, "not a dictionary"};
+  error.code = body->get(QVDErrorCodeKey).uint64().value_or(0);
+  if (const std::string* text = body->get(QVDErrorKey).string()) error.message = *text;
+  return error;
+}
+
+}  // namespace qvd::testing
