@@ -29,8 +29,11 @@ std::shared_ptr<QVDMbxClient> QVDMbxClient::initWithConnection(
   std::shared_ptr<QVDMbxClient> client(new QVDMbxClient(connection, std::move(server)));
   const platform::mbx::PeerIdentity* peer = connection->peer();
   // The listener hands over a peer it could not identify (the reason is in
-  // its log): such a peer has no executable path the daemon can trust.
-  if (peer == nullptr || peer->executablePath().empty()) {
+  // its log): such a peer has no executable path the daemon can trust. Nor
+  // has a peer whose executable file was removed or replaced since it
+  // started (or never was on a file system, like a program run from a memory
+  // file): grants follow the path, and the file there is not what runs.
+  if (peer == nullptr || peer->executablePath().empty() || peer->executableWasReplaced()) {
     QVLogOps().log(QVDiagnosticFailureLevel(),
                    "Failed to get the file system path for the process with pid %d.",
                    peer ? static_cast<int>(peer->pid()) : 0);
