@@ -169,3 +169,31 @@ TEST_F(DaemonRequestTest, SynchronousRequestsAreSubmittedSynchronously) {
 
 }  // namespace
 }  // namespace qvd::integration
+
+namespace qvd::integration {
+namespace {
+
+TEST(QvctlAgainstTheDaemonTest, ErrorRepliesAndWatchingTheStop) {
+  TemporaryRoot root;
+  Daemon daemon(root, {});
+  ASSERT_TRUE(daemon.waitUntilServing()) << daemon.log();
+  // A request the daemon refuses: qvctl shows the daemon's code and text.
+  Finished find = runProcess({QVCTL_PATH, "find", "/System/Library/PlugIns/None.ovx"}, root.path());
+  EXPECT_EQ(find.status, 1);
+  EXPECT_EQ(find.err, "qvctl: error 4: unrecognized request\n");
+
+  // The daemon's stop posts one annotation change, which a watcher sees.
+  Finished watched;
+  std::thread watcher(
+      [&] { watched = runProcess({QVCTL_PATH, "watch", "--count", "1"}, root.path()); });
+  // The watcher observes changes after it starts: give it a moment.
+  std::this_thread::sleep_for(1s);
+  EXPECT_EQ(daemon.terminate(), 0);
+  watcher.join();
+  EXPECT_EQ(watched.status, 0) << watched.err;
+  EXPECT_NE(watched.out.find("com.corvane.quorvex.annotation-change"), std::string::npos)
+      << watched.out;
+}
+
+}  // namespace
+}  // namespace qvd::integration
