@@ -9,7 +9,7 @@
 
 namespace qvd {
 
-std::optional<QVDOptions> parseOptions(const std::vector<std::string>& arguments) {
+QVDOptions parseOptions(const std::vector<std::string>& arguments) {
   QVDOptions options;
   options.serviceName = std::string(QVDServiceName);
   options.cacheLimit = QVDatabase::kDefaultCacheLimit;
@@ -43,10 +43,11 @@ std::optional<QVDOptions> parseOptions(const std::vector<std::string>& arguments
         ++options.verboseCount;
         break;
       default:
-        return std::nullopt;
+        options.status = CommandLineStatus::UsageError;
+        return options;
     }
   }
-  if (optind < argc) return std::nullopt;
+  if (optind < argc) options.status = CommandLineStatus::UsageError;
   return options;
 }
 

@@ -15,15 +15,19 @@ namespace qvd {
 
 inline constexpr const char* kUsageLine = "Usage: qvd [-S servicename] [-v]";
 
+enum class CommandLineStatus { Valid, UsageError };
+
 struct QVDOptions {
   std::string serviceName;
   std::optional<std::string> databasePath;
   std::uint64_t cacheLimit = 0;
+  // Counted up to the first usage error: each -v seen is logged even then.
   int verboseCount = 0;
+  CommandLineStatus status = CommandLineStatus::Valid;
 };
 
-// The options of `arguments` (arguments[0] is the program name), or none for
-// a usage error.
-std::optional<QVDOptions> parseOptions(const std::vector<std::string>& arguments);
+// The options of `arguments` (arguments[0] is the program name), read left
+// to right; a later -S, -d or -c replaces an earlier one.
+QVDOptions parseOptions(const std::vector<std::string>& arguments);
 
 }  // namespace qvd

@@ -11,16 +11,16 @@
 
 int main(int argc, char** argv) {
   QVLogOps().info("qvd is launching");
-  std::optional<qvd::QVDOptions> options =
-      qvd::parseOptions(std::vector<std::string>(argv, argv + argc));
-  if (!options) {
-    std::fprintf(stderr, "%s\n", qvd::kUsageLine);
-    return 2;
-  }
-  for (int i = 0; i < options->verboseCount; ++i) {
+  const qvd::QVDOptions parsed = qvd::parseOptions(std::vector<std::string>(argv, argv + argc));
+  for (int i = 0; i < parsed.verboseCount; ++i) {
     platform::log::defaultLog().error(
         "verbose option -v is ineffective; use log config --subsystem com.corvane.quorvex");
   }
+  if (parsed.status == qvd::CommandLineStatus::UsageError) {
+    std::fprintf(stderr, "%s\n", qvd::kUsageLine);
+    return 2;
+  }
+  const qvd::QVDOptions* options = &parsed;
   platform::Result<qvd::Platform> services = qvd::Platform::linuxPlatform();
   std::shared_ptr<qvd::QVDServer> server;
   if (services.ok()) {

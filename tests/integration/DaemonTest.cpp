@@ -62,6 +62,9 @@ TEST(DaemonCommandLineTest, UsageErrorsAndConstructionFailure) {
       EXPECT_FALSE(std::filesystem::exists(root / "run/quorvex/mbx")) << shown;
       EXPECT_EQ(finished.err.find("unable to construct"), std::string::npos);
     }
+    // A -v before the error is still reported as ineffective.
+    EXPECT_EQ(finished.err.find("-v is ineffective") != std::string::npos, c.arguments[0] == "-v")
+        << shown;
   }
 }
 

@@ -18,10 +18,12 @@ TEST(QVDOptionsTest, CommandLines) {
   struct Case {
     std::vector<std::string> arguments;
     std::optional<QVDOptions> expected;  // none: a usage error
+    int verboseSeen = 0;
   };
   auto options = [](std::string service, std::optional<std::string> db, std::uint64_t cache,
                     int verbose) {
-    return std::optional<QVDOptions>(QVDOptions{std::move(service), std::move(db), cache, verbose});
+    return std::optional<QVDOptions>(
+        QVDOptions{std::move(service), std::move(db), cache, verbose, CommandLineStatus::Valid});
   };
   const std::string standard(QVDServiceName);
   const std::vector<Case> cases = {
@@ -32,19 +34,24 @@ TEST(QVDOptionsTest, CommandLines) {
       {{"qvd", "-c", "12abc"}, options(standard, std::nullopt, 12, 0)},
       {{"qvd", "-c", "-5"}, options(standard, std::nullopt, 0, 0)},
       {{"qvd", "extra"}, std::nullopt},
-      {{"qvd", "-v", "extra", "-v"}, std::nullopt},
+      {{"qvd", "-v", "extra", "-v"}, std::nullopt, 1},
+      {{"qvd", "-v", "-x", "-v"}, std::nullopt, 1},
       {{"qvd", "-x"}, std::nullopt},
       {{"qvd", "-S"}, std::nullopt},
       {{"qvd", "--", "extra"}, std::nullopt},
   };
   for (const Case& c : cases) {
-    std::optional<QVDOptions> parsed = parseOptions(c.arguments);
-    ASSERT_EQ(parsed.has_value(), c.expected.has_value()) << ::testing::PrintToString(c.arguments);
-    if (!parsed) continue;
-    EXPECT_EQ(parsed->serviceName, c.expected->serviceName);
-    EXPECT_EQ(parsed->databasePath, c.expected->databasePath);
-    EXPECT_EQ(parsed->cacheLimit, c.expected->cacheLimit);
-    EXPECT_EQ(parsed->verboseCount, c.expected->verboseCount);
+    const QVDOptions parsed = parseOptions(c.arguments);
+    ASSERT_EQ(parsed.status == CommandLineStatus::Valid, c.expected.has_value())
+        << ::testing::PrintToString(c.arguments);
+    if (!c.expected) {
+      EXPECT_EQ(parsed.verboseCount, c.verboseSeen) << ::testing::PrintToString(c.arguments);
+      continue;
+    }
+    EXPECT_EQ(parsed.serviceName, c.expected->serviceName);
+    EXPECT_EQ(parsed.databasePath, c.expected->databasePath);
+    EXPECT_EQ(parsed.cacheLimit, c.expected->cacheLimit);
+    EXPECT_EQ(parsed.verboseCount, c.expected->verboseCount);
   }
 }
 
