@@ -44,6 +44,7 @@ class InputsTest : public ::testing::Test {
         t.done();
       }
     });
+    (void)testRoot();
     dir_ = platform::rootPath("inputs-" + std::to_string(::getpid()));
     std::filesystem::create_directories(dir_ + "/real");
     std::ofstream(dir_ + "/real/file") << "x";

@@ -11,9 +11,13 @@ namespace qvd::testing {
 
 namespace {
 
+std::atomic<int> gServerSerial{0};
+
+}  // namespace
+
 // One root for the whole test process: the root may only change while no
 // other thread reads it, and the dispatch pool's threads outlive each test.
-const std::string& processRoot() {
+const std::string& testRoot() {
   static const std::string root = [] {
     char pattern[] = "/tmp/qvd-test-XXXXXX";
     const char* made = ::mkdtemp(pattern);
@@ -24,10 +28,6 @@ const std::string& processRoot() {
   }();
   return root;
 }
-
-std::atomic<int> gServerSerial{0};
-
-}  // namespace
 
 Platform FakePlatform::platform() const {
   Platform services;
@@ -48,10 +48,14 @@ bool eventually(const std::function<bool()>& done, std::chrono::milliseconds lim
   return true;
 }
 
-TestServer::TestServer() {
-  (void)processRoot();
+TestServer::TestServer() : TestServer([](Platform&) {}) {}
+
+TestServer::TestServer(const std::function<void(Platform&)>& adjust) {
+  (void)testRoot();
   serviceName_ = "qvd.test." + std::to_string(::getpid()) + "." + std::to_string(++gServerSerial);
-  server_ = QVDServer::initForService(serviceName_, std::nullopt, fakes_.platform(),
+  Platform services = fakes_.platform();
+  adjust(services);
+  server_ = QVDServer::initForService(serviceName_, std::nullopt, std::move(services),
                                       TerminationSignal::NotWatched);
   if (!server_) return;
   server_->setClientObserverForTesting([this](std::shared_ptr<QVDMbxClient> client) {

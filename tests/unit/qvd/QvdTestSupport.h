@@ -4,6 +4,7 @@
 #pragma once
 
 #include <atomic>
+#include <functional>
 #include <chrono>
 #include <memory>
 #include <mutex>
@@ -39,6 +40,10 @@ struct FakePlatform {
   Platform platform() const;
 };
 
+// The temporary platform root of this test process, made (and set as the
+// root) on first use. Call it before computing any path under the root.
+const std::string& testRoot();
+
 // Polls `done` until it holds or `limit` passes.
 bool eventually(const std::function<bool()>& done, std::chrono::milliseconds limit = 10s);
 
@@ -47,6 +52,8 @@ bool eventually(const std::function<bool()>& done, std::chrono::milliseconds lim
 class TestServer {
  public:
   TestServer();
+  // With some fakes replaced by real services before the server is made.
+  explicit TestServer(const std::function<void(Platform&)>& adjust);
   ~TestServer();
 
   const std::shared_ptr<QVDServer>& server() const { return server_; }
