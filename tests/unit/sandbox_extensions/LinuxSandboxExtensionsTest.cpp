@@ -1,0 +1,212 @@
+// LinuxSandboxExtensions in one process: the key file, issuing, consuming,
+// refusing altered tokens, handles.
+#include <gtest/gtest.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <filesystem>
+#include <fstream>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "SandboxTestSupport.h"
+#include "platform/sandbox/LinuxSandboxExtensions.h"
+
+namespace platform::sandbox {
+namespace {
+
+namespace fs = std::filesystem;
+using sandbox_testing::TemporaryRoot;
+
+class LinuxSandboxExtensionsTest : public ::testing::Test {
+ protected:
+  std::string issueFile(const std::string& path) {
+    Result<std::string> token = extensions_.issueFileExtension(path, PathResolution::Canonicalise);
+    EXPECT_TRUE(token.ok()) << (token.ok() ? "" : token.error().description());
+    return token.ok() ? *token : std::string();
+  }
+  int consumeErrno(const std::string& token) {
+    Result<std::int64_t> handle = extensions_.consume(token);
+    if (handle.ok()) {
+      EXPECT_TRUE(extensions_.release(*handle).ok());
+      return 0;
+    }
+    return sandboxErrno(handle.error());
+  }
+
+  TemporaryRoot root_;
+  LinuxSandboxExtensions extensions_;
+};
+
+TEST_F(LinuxSandboxExtensionsTest, KeyIsMadeOwnerOnlyAtFirstUse) {
+  EXPECT_FALSE(fs::exists(root_.keyPath()));
+  const std::string token = issueFile(root_.path());
+  struct stat info {};
+  ASSERT_EQ(::stat(root_.keyPath().c_str(), &info), 0);
+  EXPECT_EQ(info.st_mode & 07777, 0600u);
+  EXPECT_EQ(info.st_size, 32);
+  // Nothing of the temporary file is left beside it.
+  EXPECT_EQ(std::distance(fs::directory_iterator(fs::path(root_.keyPath()).parent_path()),
+                          fs::directory_iterator()),
+            1);
+  // Another instance reads the same key: it accepts the token.
+  LinuxSandboxExtensions second;
+  Result<std::int64_t> handle = second.consume(token);
+  ASSERT_TRUE(handle.ok()) << handle.error().description();
+  EXPECT_TRUE(second.release(*handle).ok());
+}
+
+TEST_F(LinuxSandboxExtensionsTest, ConcurrentFirstUsersAgreeOnOneKey) {
+  std::vector<std::string> tokens(6);
+  std::vector<std::thread> threads;
+  for (std::size_t i = 0; i < tokens.size(); ++i) {
+    threads.emplace_back([&, i] {
+      LinuxSandboxExtensions own;
+      Result<std::string> token = own.issueServiceExtension("c", "svc" + std::to_string(i));
+      if (token.ok()) tokens[i] = *token;
+    });
+  }
+  for (std::thread& t : threads) t.join();
+  for (const std::string& token : tokens) EXPECT_EQ(consumeErrno(token), 0) << token;
+}
+
+TEST_F(LinuxSandboxExtensionsTest, UnsafeKeyFilesAreRefusedAndKept) {
+  struct Case {
+    const char* name;
+    mode_t mode;
+    std::size_t size;
+    int err;
+  } cases[] = {
+      {"group-readable", 0640, 32, EACCES},
+      {"others-readable", 0604, 32, EACCES},
+      {"group-writable", 0620, 32, EACCES},
+      {"short", 0600, 31, EINVAL},
+      {"long", 0600, 33, EINVAL},
+  };
+  for (const Case& c : cases) {
+    fs::create_directories(fs::path(root_.keyPath()).parent_path());
+    fs::remove(root_.keyPath());
+    const std::string contents(c.size, 'k');
+    std::ofstream(root_.keyPath(), std::ios::binary) << contents;
+    ASSERT_EQ(::chmod(root_.keyPath().c_str(), c.mode), 0);
+
+    sandbox_testing::VerboseCapture capture;
+    LinuxSandboxExtensions fresh;
+    Result<std::string> token = fresh.issueServiceExtension("c", "svc");
+    ASSERT_FALSE(token.ok()) << c.name;
+    EXPECT_EQ(sandboxErrno(token.error()), c.err) << c.name;
+    EXPECT_EQ(fs::file_size(root_.keyPath()), c.size) << c.name << ": key replaced";
+    std::vector<platform::log::CapturedLine> lines = capture.lines().lines();
+    ASSERT_EQ(lines.size(), 1u) << c.name;
+    EXPECT_EQ(lines[0].level, platform::log::Level::Error);
+    EXPECT_NE(lines[0].message.find("sandbox signing key unusable: " + root_.keyPath()),
+              std::string::npos)
+        << lines[0].message;
+  }
+}
+
+TEST_F(LinuxSandboxExtensionsTest, SymlinkedKeyIsRefused) {
+  const std::string good = root_.path() + "/elsewhere";
+  std::ofstream(good, std::ios::binary) << std::string(32, 'k');
+  ASSERT_EQ(::chmod(good.c_str(), 0600), 0);
+  fs::create_directories(fs::path(root_.keyPath()).parent_path());
+  fs::create_symlink(good, root_.keyPath());
+  Result<std::string> token = extensions_.issueServiceExtension("c", "svc");
+  ASSERT_FALSE(token.ok());
+  EXPECT_EQ(sandboxErrno(token.error()), ELOOP);
+}
+
+TEST_F(LinuxSandboxExtensionsTest, FilePathsAreCheckedAndCanonicalised) {
+  fs::create_directories(root_.path() + "/real/sub");
+  fs::create_directory_symlink(root_.path() + "/real", root_.path() + "/link");
+  const std::string canonical = fs::canonical(root_.path() + "/real").string();
+
+  Result<std::string> missing =
+      extensions_.issueFileExtension(root_.path() + "/absent", PathResolution::Canonicalise);
+  ASSERT_FALSE(missing.ok());
+  EXPECT_EQ(sandboxErrno(missing.error()), ENOENT);
+  Result<std::string> relative = extensions_.issueFileExtension("real", PathResolution::AsGiven);
+  ASSERT_FALSE(relative.ok());
+  EXPECT_EQ(sandboxErrno(relative.error()), EINVAL);
+
+  Result<ParsedToken> resolved = parseToken(issueFile(root_.path() + "/link/sub/.."));
+  ASSERT_TRUE(resolved.ok());
+  EXPECT_EQ(resolved->grant.subject, canonical);
+  EXPECT_EQ(resolved->grant.extensionClass, kReadOnlyFileExtensionClass);
+
+  // Taken as given, a path need not exist and keeps its spelling.
+  Result<std::string> asGiven =
+      extensions_.issueFileExtension(root_.path() + "/link/absent", PathResolution::AsGiven);
+  ASSERT_TRUE(asGiven.ok());
+  EXPECT_EQ(parseToken(*asGiven)->grant.subject, root_.path() + "/link/absent");
+}
+
+TEST_F(LinuxSandboxExtensionsTest, EveryChangedByteIsRefused) {
+  const std::string token = issueFile(root_.path());
+  ASSERT_EQ(consumeErrno(token), 0);
+  for (std::size_t i = 0; i < token.size(); ++i) {
+    for (char replacement : {'x', '0', ';', '%'}) {
+      if (token[i] == replacement) continue;
+      std::string altered = token;
+      altered[i] = replacement;
+      const int err = consumeErrno(altered);
+      EXPECT_TRUE(err == EPERM || err == EINVAL) << "byte " << i << " -> " << replacement
+                                                  << " gave " << err;
+    }
+  }
+}
+
+TEST_F(LinuxSandboxExtensionsTest, WellFormedForgeriesFailTheSignature) {
+  fs::create_directories(root_.path() + "/a");
+  const std::string token = issueFile(root_.path() + "/a");
+  const std::size_t kind = token.find(";file;");
+  const std::size_t signature = token.rfind(';') + 1;
+  struct Case {
+    const char* name;
+    std::string altered;
+  } cases[] = {
+      {"class", std::string(token).replace(5, 3, "org")},
+      {"kind", std::string(token).replace(kind, 6, ";service;")},
+      {"path", std::string(token).insert(signature - 1, "b")},
+      {"signature", std::string(token).replace(signature, 1, token[signature] == 'a' ? "b" : "a")},
+  };
+  for (const Case& c : cases) {
+    ASSERT_TRUE(parseToken(c.altered).ok()) << c.name << ": " << c.altered;
+    EXPECT_EQ(consumeErrno(c.altered), EPERM) << c.name;
+  }
+  // Signed right, but with another key: another root's.
+  TemporaryRoot other;
+  LinuxSandboxExtensions foreign;
+  Result<std::string> foreignToken = foreign.issueFileExtension("/", PathResolution::AsGiven);
+  ASSERT_TRUE(foreignToken.ok());
+  EXPECT_EQ(consumeErrno(*foreignToken), EPERM);
+}
+
+TEST_F(LinuxSandboxExtensionsTest, HandlesCountUpAndAreNeverReused) {
+  const std::string token = issueFile(root_.path());
+  Result<std::int64_t> first = extensions_.consume(token);
+  Result<std::int64_t> second = extensions_.consume(token);
+  ASSERT_TRUE(first.ok() && second.ok());
+  EXPECT_GE(*first, 1);
+  EXPECT_GT(*second, *first);
+  ASSERT_EQ(LinuxSandboxExtensions::grantForHandle(*first)->subject,
+            fs::canonical(root_.path()).string());
+
+  ASSERT_TRUE(extensions_.release(*first).ok());
+  EXPECT_FALSE(LinuxSandboxExtensions::grantForHandle(*first));
+  Status again = extensions_.release(*first);
+  ASSERT_FALSE(again.ok());
+  EXPECT_EQ(sandboxErrno(again.error()), EBADF);
+  EXPECT_EQ(sandboxErrno(extensions_.release(0).error()), EBADF);
+
+  Result<std::int64_t> third = extensions_.consume(token);
+  ASSERT_TRUE(third.ok());
+  EXPECT_GT(*third, *second);
+  EXPECT_TRUE(extensions_.release(*second).ok());
+  EXPECT_TRUE(extensions_.release(*third).ok());
+}
+
+}  // namespace
+}  // namespace platform::sandbox
