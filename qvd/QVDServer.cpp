@@ -73,6 +73,7 @@ std::shared_ptr<QVDServer> QVDServer::initForService(std::string serviceName,
       });
   if (!source.ok()) {
     QVLogOps().error("cannot watch SIGTERM: %{public}s", source.message());
+    forgetInstance();  // no half-made server stays reachable
     return nullptr;
   }
   server->sigSource_ = std::move(source).value();
@@ -85,10 +86,12 @@ std::shared_ptr<QVDServer> QVDServer::server() {
   return gServer;
 }
 
-void QVDServer::resetForTesting() {
+void QVDServer::forgetInstance() {
   std::lock_guard<std::mutex> lock(gServerMu);
   gServer.reset();
 }
+
+void QVDServer::resetForTesting() { forgetInstance(); }
 
 void QVDServer::setTerminationActionForTesting(std::function<void()> action) {
   terminationAction_ = std::move(action);

@@ -101,6 +101,7 @@ class QVDServer final : public QVDatabase, public std::enable_shared_from_this<Q
   ~QVDServer() override;
 
  private:
+  static void forgetInstance();
   void handleListenerEvent(const platform::mbx::Listener::Event& event);
   void terminate();
 
