@@ -5,16 +5,12 @@
 
 #include "platform/log/LoggerRegistry.h"
 
+#include "platform/sandbox/internal/SandboxLog.h"
+
 namespace platform::sandbox {
 namespace {
 
-const log::Logger& sandboxLog() {
-  static const log::Logger& logger = []() -> const log::Logger& {
-    auto made = log::LoggerRegistry::shared().logger("com.corvane.platform", "sandbox");
-    return made.ok() ? **made : log::defaultLog();
-  }();
-  return logger;
-}
+using internal::sandboxLog;
 
 }  // namespace
 

@@ -10,16 +10,12 @@
 #include "platform/sandbox/internal/HandleTable.h"
 #include "platform/sandbox/internal/SigningKeyFile.h"
 
+#include "platform/sandbox/internal/SandboxLog.h"
+
 namespace platform::sandbox {
 namespace {
 
-const log::Logger& sandboxLog() {
-  static const log::Logger& logger = []() -> const log::Logger& {
-    auto made = log::LoggerRegistry::shared().logger("com.corvane.platform", "sandbox");
-    return made.ok() ? **made : log::defaultLog();
-  }();
-  return logger;
-}
+using internal::sandboxLog;
 
 Result<std::string> canonicalPath(const std::string& path) {
   std::unique_ptr<char, decltype(&std::free)> resolved(::realpath(path.c_str(), nullptr),
