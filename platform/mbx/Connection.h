@@ -23,6 +23,7 @@
 #include <sys/types.h>
 
 #include <atomic>
+#include <chrono>
 #include <cstdint>
 #include <functional>
 #include <memory>
@@ -52,6 +53,9 @@ const char* connectionErrorName(ConnectionError error);
 using ConnectionEvent = std::variant<Message, ConnectionError>;
 
 class Listener;
+namespace internal {
+class ReadParking;
+}
 
 class Connection : public std::enable_shared_from_this<Connection> {
  public:
@@ -140,6 +144,15 @@ class Connection : public std::enable_shared_from_this<Connection> {
   // Reads and delivers input on the calling thread until `waiter` is done.
   // REQUIRES: this thread holds the reader role (syncReader_).
   void readUntilDone(const SyncWaiter& waiter, int fd);
+  // Switches read watching back on if a synchronous request left it off,
+  // unless a synchronous waiter is reading now (it decides when it ends).
+  void unparkReads();
+  // For the parking sweep: true when the connection needs no more sweeps
+  // (reads unparked now, or not parked any more); false while it has been
+  // parked for less than `grace`.
+  bool unparkReadsIfIdle(std::chrono::steady_clock::time_point now,
+                         std::chrono::steady_clock::duration grace);
+  friend class internal::ReadParking;
   // REQUIRES: mu_ held. Asks the delivery queue to end the connection.
   void closeLaterLocked();
 
@@ -181,6 +194,10 @@ class Connection : public std::enable_shared_from_this<Connection> {
   bool writeWatched_ = false;               // guarded by mu_: output is queued
   internal::PendingReplies pending_;        // guarded by mu_
   bool syncReader_ = false;                 // guarded by mu_: a sync waiter reads
+  // Read watching left off after a synchronous request (see ReadParking).
+  bool readsParked_ = false;                              // guarded by mu_
+  bool parkListed_ = false;                               // guarded by mu_
+  std::chrono::steady_clock::time_point parkedAt_;        // guarded by mu_
   std::shared_ptr<Connection> selfWhileActive_;  // guarded by mu_
   std::shared_ptr<void> context_;           // guarded by mu_
   std::function<void(std::shared_ptr<void>)> finalizer_;  // guarded by mu_

@@ -7,6 +7,7 @@
 
 #include "platform/dispatch/ScopedBlockingCall.h"
 #include "platform/mbx/Connection.h"
+#include "platform/mbx/internal/ReadParking.h"
 #include "platform/mbx/MbxError.h"
 #include "platform/mbx/internal/MbxLog.h"
 
@@ -45,7 +46,41 @@ void Connection::sendWithReply(Value body, std::shared_ptr<dispatch::Queue> repl
   // transmit() takes the handler only when the request went out.
   if (Status sent = transmit(std::move(frame).value(), &pending); !sent.ok()) {
     std::move(pending).complete(sent.error());
+    return;
   }
+  // The reply is read by the pool, so reads must be watched.
+  unparkReads();
+}
+
+void Connection::unparkReads() {
+  {
+    std::lock_guard<std::mutex> lock(mu_);
+    if (!readsParked_ || syncReader_) return;
+    // Taking the reader role keeps a synchronous waiter from suspending
+    // before this resume has happened.
+    readsParked_ = false;
+    syncReader_ = true;
+  }
+  source_->resume(dispatch::FdSource::Event::Readable);
+  std::lock_guard<std::mutex> lock(mu_);
+  syncReader_ = false;
+}
+
+bool Connection::unparkReadsIfIdle(std::chrono::steady_clock::time_point now,
+                                   std::chrono::steady_clock::duration grace) {
+  {
+    std::lock_guard<std::mutex> lock(mu_);
+    if (readsParked_ && !syncReader_ && now - parkedAt_ < grace) return false;
+    if (syncReader_) {
+      // A synchronous request is running: it parks again (and is listed
+      // again) when it ends only if it is not listed, so stay listed.
+      return false;
+    }
+    parkListed_ = false;
+    if (!readsParked_) return true;
+  }
+  unparkReads();
+  return true;
 }
 
 Result<Message> Connection::sendWithReplySync(Value body) {
@@ -63,28 +98,52 @@ Result<Message> Connection::sendWithReplySync(Value body) {
   Result<std::vector<std::uint8_t>> frame = encodeFrame(FrameKind::Request, 0, body);
   if (!frame.ok()) return frame.error();
   std::shared_ptr<internal::SocketHandle> socket;
+  bool wasParked = false;
   {
     std::lock_guard<std::mutex> lock(mu_);
     if (state_ == State::Suspended) return makeError(ErrorCode::NotResumed, description());
     if (state_ == State::Active && !closing_ && !syncReader_) {
       syncReader_ = true;
       socket = socket_;
+      wasParked = readsParked_;
+      readsParked_ = false;
     }
   }
   if (socket) {
     // The waiting thread reads the reply itself: the source stops watching
     // reads meanwhile, so no pool thread wakes for the reply only to hand
-    // it over.
-    source_->suspend(dispatch::FdSource::Event::Readable);
+    // it over. A previous request may have left the watching off already.
+    if (!wasParked) source_->suspend(dispatch::FdSource::Event::Readable);
     Status sent = transmit(std::move(frame).value(), &pending);
     if (sent.ok()) readUntilDone(*waiter, socket->fd());
-    // Resumed before the role is given up: the next waiter's suspend() must
-    // come after this, or the reactor could take its reply while it polls.
-    source_->resume(dispatch::FdSource::Event::Readable);
+    // Watching stays off for the next synchronous request unless someone
+    // else awaits a reply (a pool thread must read it); the parking sweep
+    // switches it on once the connection has been idle for a moment.
+    // Either way the role is given up only after: the next waiter's
+    // suspend() must come after a resume, or the reactor could take its
+    // reply while it waits.
+    bool list = false;
+    bool resume = false;
     {
+      // Decided together with giving up the role: an asynchronous request
+      // made after this sees the parked state and unparks.
+      std::lock_guard<std::mutex> lock(mu_);
+      if (pending_.size() == 0 && state_ == State::Active && !closing_) {
+        readsParked_ = true;
+        parkedAt_ = std::chrono::steady_clock::now();
+        list = !parkListed_;
+        parkListed_ = true;
+        syncReader_ = false;
+      } else {
+        resume = true;
+      }
+    }
+    if (resume) {
+      source_->resume(dispatch::FdSource::Event::Readable);
       std::lock_guard<std::mutex> lock(mu_);
       syncReader_ = false;
     }
+    if (list) internal::ReadParking::instance().park(weak_from_this());
     if (!sent.ok()) return sent.error();
   } else if (Status sent = transmit(std::move(frame).value(), &pending); !sent.ok()) {
     return sent.error();

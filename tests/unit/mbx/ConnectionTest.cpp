@@ -203,6 +203,26 @@ TEST_F(MbxConnection, GoodbyeFromTheServerIsTerminationImminent) {
   EXPECT_EQ(clientEvents_->entries(), (std::vector<std::string>{"goodbye", "invalid"}));
 }
 
+TEST_F(MbxConnection, AfterSynchronousRequestsUnsolicitedInputStillArrives) {
+  // Synchronous requests leave read watching off for the next one; it must
+  // come back on by itself, or a goodbye and the close would never reach
+  // the handler of a client that has stopped asking.
+  PeerProcess echo({"serve", "parked"});
+  ASSERT_TRUE(echo.waitForLine("ready"));
+  auto connection = connect("parked");
+  ASSERT_NE(connection, nullptr);
+  for (int i = 0; i < 3; ++i) ASSERT_TRUE(connection->sendWithReplySync(Dictionary{{"i", i}}).ok());
+  // An asynchronous request right after is answered through the pool.
+  std::atomic<bool> answered{false};
+  connection->sendWithReply(Dictionary{{"i", 3}}, nullptr,
+                            [&](Result<Message> reply) { answered = reply.ok(); });
+  ASSERT_TRUE(eventually([&] { return answered.load(); }, 2s));
+  ASSERT_TRUE(connection->sendWithReplySync(Dictionary{{"i", 4}}).ok());
+  connection->send(Dictionary{{"op", "goodbye"}});
+  ASSERT_TRUE(eventually([&] { return clientEvents_->count("invalid") == 1; }, 2s));
+  EXPECT_EQ(clientEvents_->entries(), (std::vector<std::string>{"goodbye", "invalid"}));
+}
+
 TEST_F(MbxConnection, CancelDeliversInvalidOnceAndEndsThePeersSide) {
   TestServer server("cancel");
   auto connection = connect("cancel");
