@@ -42,8 +42,12 @@ std::shared_ptr<QVDServer> QVDServer::initForService(std::string serviceName,
                                                      std::optional<std::string> databasePath,
                                                      Platform platform, TerminationSignal signal) {
   auto server = std::make_shared<QVDServer>(std::move(serviceName), std::move(platform));
-  if (platform::Status status = server->initDatabase(std::move(databasePath)); !status.ok()) {
-    QVLogOps().error("the plug-in database could not be opened: %@", status.error());
+  if (platform::Status status =
+          server->initDatabase(std::move(databasePath), server->platform_.containers);
+      !status.ok()) {
+    // Without a place for the user's choices the daemon does not run.
+    const std::string* text = status.error().localizedDescription();
+    QVLogOps().error("%{public}s", text ? *text : status.error().description());
     return nullptr;
   }
   auto listener = platform::mbx::Listener::create(server->serviceName_, server->mbxQueue_);

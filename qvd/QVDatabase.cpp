@@ -9,8 +9,13 @@ QVDatabase::QVDatabase() : sync_(platform::dispatch::SerialQueue::create("QVData
 
 QVDatabase::~QVDatabase() = default;
 
-platform::Status QVDatabase::initDatabase(std::optional<std::string> databasePath) {
-  databasePath_ = std::move(databasePath);
+platform::Status QVDatabase::initDatabase(
+    std::optional<std::string> databasePath,
+    std::shared_ptr<platform::container::ContainerManager> containers) {
+  databasePath_ = databasePath;
+  auto store = QVDAnnotationStore::initWithDatabase(std::move(databasePath), std::move(containers));
+  if (!store.ok()) return store.error();
+  annotations_ = std::move(store).value();
   return platform::Status();
 }
 

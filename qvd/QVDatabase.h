@@ -22,6 +22,8 @@
 #include "platform/dispatch/SerialQueue.h"
 #include "platform/values/Result.h"
 #include "platform/values/Uuid.h"
+#include "platform/container/ContainerManager.h"
+#include "qvd/QVDAnnotationStore.h"
 #include "qvd/QVDPlugIn.h"
 
 namespace qvd {
@@ -44,6 +46,9 @@ class QVDatabase {
   // The annotation file given with -d; none means the default location.
   const std::optional<std::string>& databasePath() const { return databasePath_; }
 
+  // The annotation store, made by initDatabase().
+  QVDAnnotationStore& annotationStore() const { return *annotations_; }
+
   // The database's own serial queue, "QVDatabase".
   const std::shared_ptr<platform::dispatch::SerialQueue>& syncQueue() const { return sync_; }
 
@@ -54,11 +59,15 @@ class QVDatabase {
 
  protected:
   QVDatabase();
-  // The database part of the server's construction.
-  platform::Status initDatabase(std::optional<std::string> databasePath);
+  // The database part of the server's construction: loads the annotation
+  // store from `databasePath` (none: its default location). Fails only when
+  // no annotation location can be had at all (the user container lookup).
+  platform::Status initDatabase(std::optional<std::string> databasePath,
+                                std::shared_ptr<platform::container::ContainerManager> containers);
 
  private:
   std::optional<std::string> databasePath_;
+  std::unique_ptr<QVDAnnotationStore> annotations_;
   std::atomic<std::uint64_t> cacheLimit_{kDefaultCacheLimit};
   const std::shared_ptr<platform::dispatch::SerialQueue> sync_;
   // Touched only on sync_.

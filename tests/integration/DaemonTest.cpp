@@ -200,3 +200,32 @@ TEST(QvctlAgainstTheDaemonTest, ErrorRepliesAndWatchingTheStop) {
 
 }  // namespace
 }  // namespace qvd::integration
+
+namespace qvd::integration {
+namespace {
+
+TEST(DaemonAnnotationLocationTest, NoUserContainerStopsTheDaemon) {
+  TemporaryRoot root;
+  // No annotation file, and the container area is a file: no place at all
+  // for the user's choices.
+  std::filesystem::create_directories(root / "var");
+  std::ofstream(root / "var/containers") << "not a directory";
+  Finished finished = runProcess({QVD_PATH}, root.path());
+  EXPECT_EQ(finished.status, 1);
+  EXPECT_NE(finished.err.find("failed to get storage container: error="), std::string::npos)
+      << finished.err;
+  EXPECT_NE(finished.err.find("unable to locate user container: error "), std::string::npos);
+  EXPECT_NE(finished.err.find("unable to construct server"), std::string::npos);
+
+  // With an annotation file that loads, the container is never needed.
+  const std::string file = root / "annotations.vmap";
+  std::ofstream(file) << "<?xml version=\"1.0\" encoding=\"UTF-8\"?>\n<vmap version=\"1.0\">\n"
+                         "<dict><key>version</key><integer>16</integer><key>data</key><dict/>"
+                         "</dict>\n</vmap>\n";
+  Daemon daemon(root, {"-d", file});
+  ASSERT_TRUE(daemon.waitUntilServing()) << daemon.log();
+  EXPECT_EQ(daemon.terminate(), 0);
+}
+
+}  // namespace
+}  // namespace qvd::integration
