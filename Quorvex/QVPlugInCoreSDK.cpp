@@ -1,10 +1,9 @@
 // SDK resolution, canonicalisation and validation of a record's manifest.
-#include <unordered_set>
-
 #include "Quorvex/QVErrors.h"
 #include "Quorvex/QVLog.h"
 #include "Quorvex/QVPlugInConstants.h"
 #include "Quorvex/QVPlugInCore.h"
+#include "platform/holvane/ManifestMerge.h"
 
 void QVPlugInCore::resolveSDK(const platform::holvane::SdkRegistry& registry) {
   const DictionaryRef info = bundleInfoDictionary();
@@ -50,41 +49,19 @@ std::optional<platform::Dictionary> QVPlugInCore::readSDKDictionary(
 }
 
 bool QVPlugInCore::sdkOverridesKey(std::string_view key) {
-  return key == QVCleanTimeoutKey;
+  return platform::holvane::sdkOverridesKey(key);
 }
 
+// The registration service merges manifests by the same rules when it
+// stores a record; one implementation keeps the two from drifting apart.
 platform::Dictionary QVPlugInCore::mergeDictionaryInto(const platform::Dictionary& source,
                                                        const platform::Dictionary& target) {
-  platform::Dictionary result = target;
-  for (const auto& [key, s] : source) {
-    const platform::Value t = result.get(key);
-    if (t.isNone() || sdkOverridesKey(key)) {
-      result.set(key, s);
-    } else if (key == QVSharedResourcesInfoKey) {
-      // Only two lists merge; a plug-in that states its resources in
-      // another shape keeps what it said.
-      if (s.array() && t.array()) {
-        result.set(key, mergeSharedResourcesInto(*s.array(), *t.array()));
-      }
-    } else if (s.dictionary() && t.dictionary()) {
-      result.set(key, mergeDictionaryInto(*s.dictionary(), *t.dictionary()));
-    }
-    // Otherwise the plug-in's own value stays, whatever its kind.
-  }
-  return result;
+  return platform::holvane::mergeDictionaryInto(source, target);
 }
 
 platform::Array QVPlugInCore::mergeSharedResourcesInto(const platform::Array& source,
                                                        const platform::Array& target) {
-  std::unordered_set<platform::Value, platform::ValueHash> seen;
-  platform::Array result;
-  result.reserve(target.size() + source.size());
-  for (const platform::Array* list : {&target, &source}) {
-    for (const platform::Value& entry : *list) {
-      if (seen.insert(entry).second) result.append(entry);
-    }
-  }
-  return result;
+  return platform::holvane::mergeSharedResourcesInto(source, target);
 }
 
 void QVPlugInCore::canonicalize() {
