@@ -59,30 +59,6 @@ void drain(int fd) {
   }
 }
 
-TEST(DispatchFdSource, DeliversOnTheTargetQueueAndRearmsAfterTheHandler) {
-  Pipe pipe;
-  auto queue = SerialQueue::create("test.fd");
-  std::string received;  // touched only on the queue
-  std::atomic<bool> offQueue{false};
-  Semaphore delivered;
-  auto source = watch(pipe.readEnd, queue, [&] {
-    if (!queue->isCurrent()) offQueue = true;
-    char buf[16];
-    ssize_t n;
-    while ((n = read(pipe.readEnd, buf, sizeof buf)) > 0) received.append(buf, size_t(n));
-    delivered.signal();
-  });
-  ASSERT_TRUE(source);
-  source->resume();
-  pipe.put("ab");
-  ASSERT_EQ(delivered.waitFor(5s), WaitResult::Succeeded);
-  pipe.put("c");
-  ASSERT_EQ(delivered.waitFor(5s), WaitResult::Succeeded);
-  queue->sync([&] { EXPECT_EQ(received, "abc"); });
-  EXPECT_FALSE(offQueue);
-  source->cancel();
-}
-
 TEST(DispatchFdSource, NeverDeliversTwiceWhileAHandlerIsPendingOrRunning) {
   // On the concurrent queue a duplicate delivery would run in parallel.
   Pipe pipe;

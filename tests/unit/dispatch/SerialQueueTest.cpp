@@ -116,75 +116,51 @@ TEST(DispatchSerialQueue, HigherPriorityQueuesGetThePoolFirst) {
   EXPECT_THAT(order, ::testing::ElementsAre("high", "mid", "low"));
 }
 
-TEST(DispatchSerialQueue, SyncRunsInlineOnAnIdleQueueWithTheQueueCurrent) {
-  auto queue = SerialQueue::create("test.inline");
-  std::thread::id ranOn;
-  bool currentInside = false;
-  std::string labelInside;
-  queue->sync([&] {
-    ranOn = std::this_thread::get_id();
-    currentInside = queue->isCurrent();
-    labelInside = currentQueueLabel();
-  });
-  EXPECT_EQ(ranOn, std::this_thread::get_id());
-  EXPECT_TRUE(currentInside);
-  EXPECT_EQ(labelInside, "test.inline");
-  EXPECT_FALSE(queue->isCurrent());
-  EXPECT_EQ(currentQueueLabel(), "");
-}
-
-TEST(DispatchSerialQueue, SyncOnABusyQueueWaitsBehindPendingWorkAndHops) {
-  auto queue = SerialQueue::create("test.busy-sync");
-  Semaphore started, gate;
-  std::vector<int> order;  // touched only on the queue
-  queue->async([&] {
-    started.signal();
-    gate.wait();
-    order.push_back(1);
-  });
-  queue->async([&] { order.push_back(2); });
-  ASSERT_EQ(started.waitFor(5s), WaitResult::Succeeded);
-  std::thread releaser([&] {
-    // Wait until the sync item is queued behind item 2, then release.
-    testing::eventually([&] { return queue->pendingCountForTesting() == 2; });
-    gate.signal();
-  });
-  std::thread::id ranOn;
-  queue->sync([&] {
-    order.push_back(3);
-    ranOn = std::this_thread::get_id();
-  });
-  releaser.join();
-  EXPECT_EQ(order, (std::vector<int>{1, 2, 3}));
-  EXPECT_NE(ranOn, std::this_thread::get_id());
-}
-
-TEST(DispatchSerialQueue, NestedSyncsKeepTheWholeChainCurrentInlineOrHopping) {
+TEST(DispatchSerialQueue, SyncRunsInlineWhenIdleAndHopsBehindPendingWorkKeepingTheChainCurrent) {
   auto a = SerialQueue::create("test.a");
   auto b = SerialQueue::create("test.b");
   auto c = SerialQueue::create("test.c");
   auto unrelated = SerialQueue::create("test.unrelated");
+  const std::thread::id caller = std::this_thread::get_id();
+  std::thread::id inlineOn, hopOn;
   bool inlineChain = false;
   bool hopChain = false;
-  Semaphore gate;
+  std::vector<int> order;  // touched only on b
+  Semaphore started, gate;
   a->sync([&] {
     b->sync([&] {
       c->sync([&] {
+        inlineOn = std::this_thread::get_id();
         inlineChain = a->isCurrent() && b->isCurrent() && c->isCurrent() &&
                       !unrelated->isCurrent() && currentQueueLabel() == "test.c";
       });
     });
-    // Make b busy so the next sync runs on a pool thread, not here.
-    b->async([&] { gate.wait(); });
+    // Make b busy so the next sync waits behind items 1 and 2 on a pool thread.
+    b->async([&] {
+      started.signal();
+      gate.wait();
+      order.push_back(1);
+    });
+    b->async([&] { order.push_back(2); });
+    ASSERT_EQ(started.waitFor(5s), WaitResult::Succeeded);
     std::thread releaser([&] {
-      testing::eventually([&] { return b->pendingCountForTesting() == 1; });
+      testing::eventually([&] { return b->pendingCountForTesting() == 2; });
       gate.signal();
     });
-    b->sync([&] { hopChain = a->isCurrent() && b->isCurrent() && !c->isCurrent(); });
+    b->sync([&] {
+      order.push_back(3);
+      hopOn = std::this_thread::get_id();
+      hopChain = a->isCurrent() && b->isCurrent() && !c->isCurrent();
+    });
     releaser.join();
   });
+  EXPECT_EQ(inlineOn, caller);
   EXPECT_TRUE(inlineChain);
+  EXPECT_NE(hopOn, caller);
   EXPECT_TRUE(hopChain);
+  EXPECT_EQ(order, (std::vector<int>{1, 2, 3}));
+  EXPECT_FALSE(a->isCurrent());
+  EXPECT_EQ(currentQueueLabel(), "");
 }
 
 TEST(DispatchSerialQueue, PendingWorkKeepsTheQueueAlive) {
@@ -200,19 +176,15 @@ TEST(DispatchSerialQueue, PendingWorkKeepsTheQueueAlive) {
   EXPECT_TRUE(testing::eventually([&] { return weak.expired(); }));
 }
 
-using DispatchSerialQueueDeathTest = ::testing::Test;
-
-TEST(DispatchSerialQueueDeathTest, SyncOntoAQueueOnTheCurrentChainAborts) {
+TEST(DispatchSerialQueueDeathTest, SyncOntoTheCurrentChainAndWrongQueueAssertsAbort) {
   GTEST_FLAG_SET(death_test_style, "threadsafe");
   auto a = SerialQueue::create("test.self");
   EXPECT_DEATH(a->sync([&] { a->sync([] {}); }), "sync onto queue 'test.self'.*deadlock");
   auto b = SerialQueue::create("test.other");
   EXPECT_DEATH(a->sync([&] { b->sync([&] { a->sync([] {}); }); }),
                "sync onto queue 'test.self'.*deadlock");
-}
 
-TEST(DispatchSerialQueueDeathTest, AssertOnQueueNamesExpectedAndActualQueues) {
-  GTEST_FLAG_SET(death_test_style, "threadsafe");
+  // QV_ASSERT_ON_QUEUE names the expected and the actual queue.
   auto expected = SerialQueue::create("test.expected");
   auto actual = SerialQueue::create("test.actual");
   actual->sync([&] { QV_ASSERT_ON_QUEUE(actual); });  // passes

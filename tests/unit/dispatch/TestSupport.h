@@ -2,7 +2,6 @@
 #pragma once
 
 #include <chrono>
-#include <filesystem>
 #include <fstream>
 #include <functional>
 #include <string>
@@ -41,17 +40,6 @@ inline int processThreadCount() {
     if (line.rfind("Threads:", 0) == 0) return std::stoi(line.substr(8));
   }
   return -1;
-}
-
-// How many of this process's threads are named `name`.
-inline int threadsNamed(const std::string& name) {
-  int count = 0;
-  for (const auto& task : std::filesystem::directory_iterator("/proc/self/task")) {
-    std::ifstream comm(task.path() / "comm");
-    std::string line;
-    if (std::getline(comm, line) && line == name) ++count;
-  }
-  return count;
 }
 
 // Cancels `source` and returns once its cancel handler has run, that is once

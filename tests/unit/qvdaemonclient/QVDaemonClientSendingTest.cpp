@@ -54,22 +54,6 @@ class QVDaemonClientSending : public ::testing::Test {
   TemporaryRoot root_;
 };
 
-TEST_F(QVDaemonClientSending, SynchronousMatchFinishesOnTheCallingThreadBeforeReturning) {
-  qvdtest::FakeDaemon daemon("qvd.sync");
-  daemon.answerWith(Dictionary{{"matches", platform::Array{}}});
-  auto qvd = client("qvd.sync");
-  Seen seen;
-  qvd->matchPlugIns(Dictionary{{"k", "v"}}, QVDiscoverSynchronous, seen.handler(qvd));
-  ASSERT_TRUE(seen.ran);
-  EXPECT_EQ(seen.thread, std::this_thread::get_id());
-  EXPECT_FALSE(seen.onReplyQueue);
-  ASSERT_TRUE(seen.reply->ok());
-  EXPECT_FALSE(QVDaemonClient::errorInReply(*seen.reply));
-  Dictionary request = daemon.request(1);
-  EXPECT_EQ(request.get("sync"), Value(true));
-  EXPECT_EQ(request.get("flags"), Value(QVDiscoverSynchronous));
-}
-
 TEST_F(QVDaemonClientSending, AsynchronousMatchReturnsAtOnceAndRepliesOnTheReplyQueue) {
   qvdtest::FakeDaemon daemon("qvd.async");
   daemon.holdReplies();
@@ -170,7 +154,7 @@ TEST_F(QVDaemonClientSending, RequestsAndRepliesAreLoggedToTrafficAndFindsToOps)
   EXPECT_EQ(traffic[1], "reply: " + Value(Dictionary{{"answer", 42}}).description());
 }
 
-TEST_F(QVDaemonClientSending, NestedValuesSurviveTheWireBothWays) {
+TEST_F(QVDaemonClientSending, SynchronousMatchCarriesNestedValuesBothWays) {
   qvdtest::FakeDaemon daemon("qvd.values");
   daemon.answerWith([](const Dictionary& request) {
     return Dictionary{{"matches", request.get("rules").dictionary()->get("payload")}};
@@ -185,9 +169,16 @@ TEST_F(QVDaemonClientSending, NestedValuesSurviveTheWireBothWays) {
   });
   const Value wire = QVDaemonClient::convertToMBX(payload, 3);
   ASSERT_FALSE(wire.isNone());
+  // A synchronous match finishes on the calling thread before returning.
   Seen seen;
   qvd->matchPlugIns(Dictionary{{"payload", wire}}, QVDiscoverSynchronous, seen.handler(qvd));
+  ASSERT_TRUE(seen.ran);
+  EXPECT_EQ(seen.thread, std::this_thread::get_id());
+  EXPECT_FALSE(seen.onReplyQueue);
+  EXPECT_EQ(daemon.request(1).get("sync"), Value(true));
+  EXPECT_EQ(daemon.request(1).get("flags"), Value(QVDiscoverSynchronous));
   ASSERT_TRUE(seen.reply->ok());
+  EXPECT_FALSE(QVDaemonClient::errorInReply(*seen.reply));
   const Value back = qvd->convertFromMBX(seen.reply->value().dictionary()->get("matches"));
   EXPECT_EQ(back, payload) << back.description();
   EXPECT_TRUE(back.dictionary()->get("date").date());

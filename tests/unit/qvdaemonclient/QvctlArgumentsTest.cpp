@@ -28,6 +28,7 @@ platform::Result<Invocation> parse(std::vector<std::string_view> args,
 }
 
 TEST(QvctlArguments, AcceptedCommandLines) {
+  const std::string withPath = std::string(kU1) + "=Plug.ovx";
   struct Case {
     std::vector<std::string_view> args;
     std::function<void(const Invocation&)> check;
@@ -87,6 +88,15 @@ TEST(QvctlArguments, AcceptedCommandLines) {
          EXPECT_EQ(i.flags, 3u);
          EXPECT_EQ(i.paths, std::vector<std::string>{"/home/user/work/-odd-name"});
        }},
+      // ready: UUID=PATH pairs keep their order, the environment comes along.
+      {{"ready", "--env", "LANG=C", "--env=EMPTY=", withPath, kU2, "--flags", "7"},
+       [](const Invocation& i) {
+         EXPECT_EQ(i.plugIns, (QVDPlugInMap{{"/home/user/work/Plug.ovx", kUuid1}, {"", kUuid2}}));
+         ASSERT_TRUE(i.environment);
+         EXPECT_EQ(Value(*i.environment), Value(Dictionary{{"LANG", "C"}, {"EMPTY", ""}}));
+         EXPECT_EQ(i.flags, 7u);
+         EXPECT_EQ(i.sending, QVDSending::Asynchronous);
+       }},
       {{"release", kU2},
        [](const Invocation& i) { EXPECT_EQ(i.uuids, std::vector<Uuid>{kUuid2}); }},
       {{"watch", "--count", "2"}, [](const Invocation& i) { EXPECT_EQ(i.count, 2u); }},
@@ -108,15 +118,6 @@ TEST(QvctlArguments, AcceptedCommandLines) {
     ASSERT_TRUE(parsed.ok()) << parsed.error().description();
     c.check(parsed.value());
   }
-  // ready: UUID=PATH pairs keep their order, the environment comes along.
-  const std::string withPath = std::string(kU1) + "=Plug.ovx";
-  auto ready = parse({"ready", "--env", "LANG=C", "--env=EMPTY=", withPath, kU2, "--flags", "7"});
-  ASSERT_TRUE(ready.ok()) << ready.error().description();
-  EXPECT_EQ(ready.value().plugIns,
-            (QVDPlugInMap{{"/home/user/work/Plug.ovx", kUuid1}, {"", kUuid2}}));
-  EXPECT_EQ(Value(*ready.value().environment), Value(Dictionary{{"LANG", "C"}, {"EMPTY", ""}}));
-  EXPECT_EQ(ready.value().flags, 7u);
-  EXPECT_EQ(ready.value().sending, QVDSending::Asynchronous);
 }
 
 TEST(QvctlArguments, RefusedCommandLinesSayWhy) {
