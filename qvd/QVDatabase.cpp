@@ -43,9 +43,13 @@ std::shared_ptr<const QVDPlugIn> QVDatabase::findPlugInAtPath(std::string_view u
 }
 
 void QVDatabase::addPlugInForTesting(std::shared_ptr<const QVDPlugIn> plugIn) {
+  const std::optional<platform::Uuid> uuid = plugIn ? plugIn->uuid() : std::nullopt;
+  const std::optional<std::string> path = plugIn ? plugIn->path() : std::nullopt;
+  // A built plug-in always has both; anything else cannot be looked up.
+  if (!uuid || !path) return;
   sync_->sync([&] {
-    byUuid_[plugIn->uuid().toString()] = plugIn;
-    byPath_[plugIn->path()] = plugIn;
+    byUuid_[uuid->toString()] = plugIn;
+    byPath_[*path] = plugIn;
   });
 }
 

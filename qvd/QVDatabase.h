@@ -53,6 +53,7 @@ class QVDatabase {
   const std::shared_ptr<platform::dispatch::SerialQueue>& syncQueue() const { return sync_; }
 
   // Makes `plugIn` known to the look-ups, until the registry provides them.
+  // A null plug-in, or one without uuid or path, is ignored.
   void addPlugInForTesting(std::shared_ptr<const QVDPlugIn> plugIn);
 
   static constexpr std::uint64_t kDefaultCacheLimit = 1000000;

@@ -8,7 +8,10 @@
 #include <fstream>
 
 #include "Quorvex/QVDConstants.h"
+#include "platform/holvane/testing/FakeRegistry.h"
+#include "platform/locale/testing/FakeLocaleService.h"
 #include "platform/root/Root.h"
+#include "platform/sandbox/testing/FakeSandboxExtensions.h"
 #include "qvd/Transaction.h"
 #include "tests/unit/qvd/QvdTestSupport.h"
 
@@ -37,7 +40,7 @@ class InputsTest : public ::testing::Test {
     Transaction::addRequestForTesting("uuids", [](Transaction& t) {
       Array found;
       if (t.processUuidList([&](const std::shared_ptr<const QVDPlugIn>& plugIn) {
-            found.append(plugIn->path());
+            found.append(plugIn->path().value_or(""));
             return true;
           })) {
         t.reply().set("found", found);
@@ -62,8 +65,27 @@ class InputsTest : public ::testing::Test {
     return reply.ok() ? *reply : Value();
   }
 
+  // A real plug-in built from a registration record at `path` (a service
+  // plug-in with a data container, so that it passes validation).
+  std::shared_ptr<const QVDPlugIn> plugInFromRecord(const std::string& path) {
+    platform::holvane::PlugInRecord record;
+    record.uuid = Uuid::generate();
+    record.path = path;
+    record.identifier = "com.example.inputs." + std::filesystem::path(path).stem().string();
+    record.dataContainer = platform::rootPath("var/containers/Data/" + record.identifier);
+    record.info = Dictionary{
+        {"XOExtension", Dictionary{{"XOExtensionProtocol", "p"},
+                                   {"XOExtensionAttributes", Dictionary{}}}}};
+    registry_->put(record);
+    return QVDPlugIn::initWithHVData(
+        record, {registry_, std::make_shared<platform::locale::FakeLocaleService>(),
+                 std::make_shared<platform::sandbox::FakeSandboxExtensions>()});
+  }
+
   TestServer server_;
   std::string dir_;
+  std::shared_ptr<platform::holvane::FakeRegistry> registry_ =
+      std::make_shared<platform::holvane::FakeRegistry>();
 };
 
 TEST_F(InputsTest, Paths) {
@@ -100,11 +122,16 @@ TEST_F(InputsTest, Paths) {
 }
 
 TEST_F(InputsTest, Uuids) {
-  const Uuid known = Uuid::generate();
   const Uuid unknown = Uuid::generate();
-  server_.server()->addPlugInForTesting(std::make_shared<QVDPlugIn>(known, "/System/Known.ovx"));
-  const Uuid byPath = Uuid::generate();
-  server_.server()->addPlugInForTesting(std::make_shared<QVDPlugIn>(byPath, "/System/ByPath.ovx"));
+  const std::string knownPath = platform::rootPath("System/Known.ovx");
+  const std::string byPathPath = platform::rootPath("System/ByPath.ovx");
+  auto knownPlugIn = plugInFromRecord(knownPath);
+  auto byPathPlugIn = plugInFromRecord(byPathPath);
+  ASSERT_NE(knownPlugIn, nullptr);
+  ASSERT_NE(byPathPlugIn, nullptr);
+  const Uuid known = *knownPlugIn->uuid();
+  server_.server()->addPlugInForTesting(knownPlugIn);
+  server_.server()->addPlugInForTesting(byPathPlugIn);
   struct Case {
     const char* what;
     Value uuids;
@@ -120,14 +147,14 @@ TEST_F(InputsTest, Uuids) {
       {"unknown without paths", Array{unknown}, Value(), Value(),
        {4, "no such plugin (uuid not found)"}},
       {"empty list", Array{}, Value(), Array{}, {}},
-      {"known", Array{known, known}, Value(), Array{"/System/Known.ovx", "/System/Known.ovx"}, {}},
+      {"known", Array{known, known}, Value(), Array{knownPath, knownPath}, {}},
       {"unknown found by its parallel path", Array{known, unknown},
-       Array{"/System/Known.ovx", "/System/ByPath.ovx"},
-       Array{"/System/Known.ovx", "/System/ByPath.ovx"}, {}},
+       Array{knownPath, byPathPath},
+       Array{knownPath, byPathPath}, {}},
       {"paths of another length are ignored", Array{known, unknown, known},
-       Array{"/System/ByPath.ovx", "/System/ByPath.ovx"}, Value(),
+       Array{byPathPath, byPathPath}, Value(),
        {4, "no such plugin (uuid not found)"}},
-      {"paths that are no list are ignored", Array{unknown}, Value("/System/ByPath.ovx"), Value(),
+      {"paths that are no list are ignored", Array{unknown}, Value(byPathPath), Value(),
        {4, "no such plugin (uuid not found)"}},
       {"a parallel path that is no text", Array{unknown}, Array{7}, Value(),
        {4, "no such plugin (uuid not found)"}},

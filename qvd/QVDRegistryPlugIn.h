@@ -1,0 +1,152 @@
+// QVDPlugIn: the daemon's plug-in record, built from the
+// registration service's record of a plug-in. Where the base record reads
+// stored dictionaries, this one reads the registration service's current
+// view: its info dictionary and localized names are fetched afresh from a
+// current registration record whenever the registration generation has
+// changed, and kept otherwise. It validates itself when built, exposes its
+// entitlements, names the key its annotations are kept under, and adds to a
+// plug-in form the sandbox tokens a host needs to reach the plug-in.
+//
+// Thread safety: safe from any thread. Fields set at construction never
+// change afterwards; the five caches (info dictionary and four localized
+// values) share one generation stamp and are refreshed under one recursive
+// lock, while single reads and the localized setters are atomic and lock-free
+// with respect to that lock.
+#pragma once
+
+#include <memory>
+#include <mutex>
+#include <optional>
+#include <string>
+#include <string_view>
+
+#include "Quorvex/QVAtomicField.h"
+#include "Quorvex/QVPlugInCore.h"
+#include "platform/holvane/RegistrationRecord.h"
+#include "platform/holvane/Registry.h"
+#include "platform/locale/LocaleService.h"
+#include "platform/sandbox/SandboxExtensions.h"
+#include "platform/values/Error.h"
+#include "platform/values/Uuid.h"
+#include "platform/values/Value.h"
+#include "qvd/QVDAnnotated.h"
+
+namespace qvd {
+
+// The entitlement whose string value names the plug-in whose annotations
+// this one takes over.
+inline constexpr std::string_view QVDReplacePlugInEntitlement =
+    "com.corvane.developer.replace-plugin";
+// The strings tables localized names and Stowage action titles come from.
+inline constexpr std::string_view QVDInfoStringsTable = "InfoPlist";
+inline constexpr std::string_view QVDActionStringsTable = "Localizable";
+
+class QVDPlugIn final : public QVPlugInCore, public QVDAnnotated {
+ public:
+  // The platform services a plug-in keeps for its whole life: the
+  // registration service (fresh records, generation), the locale (names)
+  // and the token issuer (augmentForm).
+  struct Services {
+    std::shared_ptr<const platform::holvane::Registry> registry;
+    std::shared_ptr<const platform::locale::LocaleService> locale;
+    std::shared_ptr<const platform::sandbox::SandboxExtensions> extensions;
+  };
+
+  // ---- Construction and validation (QVDRegistryPlugIn.cpp) ----
+
+  // The plug-in of `record`, or null when the record has no location or
+  // identifier, or the plug-in fails `diagnose` (logged). Localized names
+  // are not fetched here.
+  // REQUIRES: every service in `services` is non-null.
+  static std::shared_ptr<QVDPlugIn> initWithHVData(const platform::holvane::PlugInRecord& record,
+                                                   Services services);
+
+  // A current registration record of this plug-in: by UUID, else by path.
+  std::optional<platform::holvane::PlugInRecord> getProxy() const;
+
+  // Entries stay in the daemon's cache until a purge or an uninstall.
+  bool isStillValid() const { return true; }
+
+  // The base validation, then: a data container for all but data plug-ins,
+  // and a location on the system volume for plug-ins outside applications.
+  std::optional<platform::Error> diagnose() const override;
+
+  // ---- Entitlements and annotation key (QVDRegistryPlugIn.cpp) ----
+
+  // entitlements and originalIdentifier are the base record's fields, set
+  // from the registration record at construction.
+  std::optional<std::string> dataContainerURL() const override { return dataContainerURL_.copy(); }
+  // entitlements[key], or none.
+  platform::Value valueForEntitlement(std::string_view key) const;
+  // Held unless absent, false or 0.
+  bool hasEntitlement(std::string_view key) const;
+  // The replace-plugin entitlement when it is a string, else identifier.
+  std::string annotationKey() const override;
+
+  // ---- Cached views of the registration service (QVDRegistryPlugInCaches.cpp) ----
+
+  // The current info dictionary (none when no current record exists).
+  DictionaryRef bundleInfoDictionary() const override;
+  // (infoKey "XOExtension")[key]: the current manifest, unlike the base,
+  // which reads the plug-in dictionary stored at construction.
+  platform::Value pluginKey(std::string_view key) const override;
+  // Names answer "" and action names an empty dictionary rather than none.
+  std::optional<std::string> localizedName() const override;
+  std::optional<std::string> localizedShortName() const override;
+  std::optional<std::string> localizedContainingName() const override;
+  DictionaryRef localizedStowageActionNames() const override;
+  // Replace the cached value atomically, without the plug-in's lock.
+  void setLocalizedName(std::optional<std::string> s) override { name_.store(std::move(s)); }
+  void setLocalizedShortName(std::optional<std::string> s) override {
+    shortName_.store(std::move(s));
+  }
+  void setLocalizedContainingName(std::optional<std::string> s) override {
+    containingName_.store(std::move(s));
+  }
+  void setLocalizedStowageActionNames(std::optional<platform::Dictionary> d) override {
+    actionNames_.store(std::move(d));
+  }
+
+  // ---- Form and Stowage (QVDRegistryPlugInForm.cpp) ----
+
+  // Adds "extensions" (tokens for the shared resources, "." for an
+  // application extension) and, for plug-ins other than data plug-ins,
+  // "service-extension" when one can be issued.
+  void augmentForm(platform::Dictionary& form) const;
+  // Action name to localized title for the Stowage actions in `qvdict`,
+  // looked up in the "Localizable" table of `record`'s bundle; a name
+  // without a translation stands for itself.
+  platform::Dictionary localizedStowageActionNamesForQVDict(
+      const platform::holvane::PlugInRecord& record, const platform::Dictionary& qvdict) const;
+  // `info` without its entries whose key begins with "DT".
+  static platform::Dictionary prunedInfoDictionaryFor(const platform::Dictionary& info);
+
+ private:
+  enum class LocalizedCache { Name, ShortName, ContainingName, StowageActionNames };
+
+  explicit QVDPlugIn(Services services) : services_(std::move(services)) {}
+
+  // Whether `generation` is the stamp the caches were refreshed at.
+  bool isFresh(const platform::Uuid& generation) const;
+  // Refreshes `which` when it is empty or stale; the caller reads it after.
+  void refreshLocalized(LocalizedCache which) const;
+  bool hasLocalized(LocalizedCache which) const;
+  void storeLocalizedFrom(LocalizedCache which,
+                          const std::optional<platform::holvane::PlugInRecord>& record) const;
+  std::optional<std::string> containingNameOf(const platform::holvane::PlugInRecord& record) const;
+  std::string currentLocale() const;
+  void logNoFreshProxy() const;
+
+  const Services services_;
+  QVAtomicField<std::string> dataContainerURL_;
+  // The caches; one stamp serves all five.
+  mutable QVAtomicField<std::string> name_;
+  mutable QVAtomicField<std::string> shortName_;
+  mutable QVAtomicField<std::string> containingName_;
+  mutable QVAtomicField<platform::Dictionary> actionNames_;
+  mutable QVAtomicField<platform::Dictionary> infoVmap_;
+  mutable QVAtomicField<platform::Uuid> hvKnowledgeUUID_;
+  mutable std::recursive_mutex lock_;
+};
+
+}  // namespace qvd
