@@ -2,9 +2,13 @@
 
 #include "platform/codesign/LinuxEntitlementStore.h"
 #include "platform/container/LinuxContainerManager.h"
+#include "platform/holvane/LinuxRegistry.h"
+#include "platform/holvane/LinuxSdkRegistry.h"
+#include "platform/locale/LinuxLocaleService.h"
 #include "platform/notify/LinuxNotificationCenter.h"
 #include "platform/prefs/LinuxPreferenceStore.h"
 #include "platform/sandbox/LinuxSandboxCheck.h"
+#include "platform/sandbox/LinuxSandboxExtensions.h"
 
 namespace qvd {
 
@@ -17,6 +21,17 @@ platform::Result<Platform> Platform::linuxPlatform() {
   services.preferences = std::make_shared<platform::prefs::LinuxPreferenceStore>();
   services.notifications = std::make_shared<platform::notify::LinuxNotificationCenter>();
   services.containers = std::make_shared<platform::container::LinuxContainerManager>();
+  // The start-up scan registers what lies in the system and application
+  // locations, so that the daemon knows the plug-ins installed while it was
+  // not running.
+  auto registry = platform::holvane::LinuxRegistry::open(
+      platform::holvane::RegistryLocations::current(),
+      std::make_shared<platform::holvane::LinuxSdkRegistry>(), services.entitlements,
+      platform::holvane::StartupScan::Run);
+  if (!registry.ok()) return registry.error();
+  services.registry = std::move(registry).value();
+  services.locale = std::make_shared<platform::locale::LinuxLocaleService>();
+  services.extensions = std::make_shared<platform::sandbox::LinuxSandboxExtensions>();
   return services;
 }
 

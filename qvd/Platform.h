@@ -10,9 +10,12 @@
 
 #include "platform/codesign/EntitlementStore.h"
 #include "platform/container/ContainerManager.h"
+#include "platform/holvane/Registry.h"
+#include "platform/locale/LocaleService.h"
 #include "platform/notify/NotificationCenter.h"
 #include "platform/prefs/PreferenceStore.h"
 #include "platform/sandbox/SandboxCheck.h"
+#include "platform/sandbox/SandboxExtensions.h"
 #include "platform/values/Result.h"
 
 namespace qvd {
@@ -23,15 +26,21 @@ struct Platform {
   std::shared_ptr<const platform::prefs::PreferenceStore> preferences;
   std::shared_ptr<platform::notify::NotificationCenter> notifications;
   std::shared_ptr<platform::container::ContainerManager> containers;
+  // Which plug-ins are installed: the database's source of truth.
+  std::shared_ptr<platform::holvane::Registry> registry;
+  std::shared_ptr<platform::locale::LocaleService> locale;
+  std::shared_ptr<platform::sandbox::SandboxExtensions> extensions;
 
-  // The Linux implementations, all under the platform root. Fails when this
+  // The Linux implementations, all under the platform root; the registry
+  // has registered what is installed before this returns. Fails when this
   // process's own identity (which the sandbox check compares peers with)
-  // cannot be taken.
+  // cannot be taken, or when no registration database can be made.
   static platform::Result<Platform> linuxPlatform();
 
   // True when every service is present.
   bool complete() const {
-    return entitlements && sandbox && preferences && notifications && containers;
+    return entitlements && sandbox && preferences && notifications && containers && registry &&
+           locale && extensions;
   }
 };
 

@@ -43,7 +43,7 @@ std::shared_ptr<QVDServer> QVDServer::initForService(std::string serviceName,
                                                      Platform platform, TerminationSignal signal) {
   auto server = std::make_shared<QVDServer>(std::move(serviceName), std::move(platform));
   if (platform::Status status =
-          server->initDatabase(std::move(databasePath), server->platform_.containers);
+          server->initDatabase(std::move(databasePath), server->platform_);
       !status.ok()) {
     // Without a place for the user's choices the daemon does not run.
     const std::string* text = status.error().localizedDescription();

@@ -1,56 +1,129 @@
+// Construction, the cache and automatic election of the plug-in database.
 #include "qvd/QVDatabase.h"
 
-#include "Quorvex/QVFileURL.h"
+#include "Quorvex/QVDConstants.h"
+#include "Quorvex/QVErrors.h"
 #include "Quorvex/QVLog.h"
+#include "qvd/QVDAnnotationConstants.h"
 
 namespace qvd {
 
-QVDatabase::QVDatabase() : sync_(platform::dispatch::SerialQueue::create("QVDatabase")) {}
+QVDatabase::QVDatabase()
+    : sync_(platform::dispatch::SerialQueue::create("QVDatabase")),
+      cache_(std::make_shared<QVDPlugInCache>(sync_)) {}
 
 QVDatabase::~QVDatabase() = default;
 
-platform::Status QVDatabase::initDatabase(
-    std::optional<std::string> databasePath,
-    std::shared_ptr<platform::container::ContainerManager> containers) {
+platform::Status QVDatabase::initDatabase(std::optional<std::string> databasePath,
+                                          const Platform& services) {
+  if (!services.registry || !services.locale || !services.extensions) {
+    return QVErrorWithCodeMessage(QVErrorInvalidRequest,
+                                  "the plug-in database needs the registration, locale and "
+                                  "sandbox extension services");
+  }
   databasePath_ = databasePath;
-  auto store = QVDAnnotationStore::initWithDatabase(std::move(databasePath), std::move(containers));
+  auto store = QVDAnnotationStore::initWithDatabase(std::move(databasePath), services.containers);
   if (!store.ok()) return store.error();
   annotations_ = std::move(store).value();
+  registry_ = services.registry;
+  plugInServices_ = {services.registry, services.locale, services.extensions};
+
+  // The observers outlive nothing they borrow: both hold the cache weakly.
+  // The registry runs its observers on its own queue, and the database
+  // queue calls into the registry (a look-up by UUID runs there); waiting
+  // on the database queue from the registry's would risk each waiting on
+  // the other, so the drop is queued instead. It still runs before any
+  // look-up submitted after the notice.
+  std::weak_ptr<QVDPlugInCache> weakCache = cache_;
+  registry_->addUninstallObserver([weakCache](const platform::holvane::PlugInRecord& record) {
+    const std::shared_ptr<QVDPlugInCache> cache = weakCache.lock();
+    if (!cache) return;
+    const platform::Uuid uuid = record.uuid;
+    cache->queue()->async([weakCache, uuid] {
+      if (auto alive = weakCache.lock()) alive->remove(uuid);
+    });
+  });
+
+  // Names are localized when a plug-in object is built, so a new locale
+  // makes every cached object stale. The notice is delivered on the
+  // database queue itself, where the purge must run anyway.
+  auto observation =
+      services.locale->observeChanges(sync_, [weakCache](const std::string& /*locale*/) {
+        QVLogOps().notice("locale change detected; purging cache");
+        if (auto cache = weakCache.lock()) cache->purgeToLimit(0);
+      });
+  if (observation.ok()) {
+    regionObserver_ = std::move(observation).value();
+  } else {
+    // A system without a locale configuration directory still serves; its
+    // cached names simply stay in the locale they were made in.
+    QVLogOps().error("cannot observe locale changes: %{public}@", observation.error());
+  }
   return platform::Status();
 }
 
-std::shared_ptr<const QVDPlugIn> QVDatabase::findPlugIn(const platform::Uuid& uuid) {
-  std::shared_ptr<const QVDPlugIn> found;
+std::shared_ptr<QVDPlugIn> QVDatabase::cachedOnQueue(const platform::Uuid& uuid) {
+  QV_ASSERT_ON_QUEUE(sync_);
+  return cache_->validEntry(uuid);
+}
+
+std::shared_ptr<QVDPlugIn> QVDatabase::plugInForProxy(
+    const platform::holvane::PlugInRecord& record) {
+  std::shared_ptr<QVDPlugIn> found;
   sync_->sync([&] {
-    auto it = byUuid_.find(uuid.toString());
-    if (it != byUuid_.end()) found = it->second;
+    // The nil UUID is what a record made without one holds.
+    if (record.uuid.isNull()) {
+      if (QVInternalDiagnostics()) {
+        QVLogOps().fault("Expected pluginUUID to be non-nil.");
+      } else {
+        QVLogOps().error("Expected pluginUUID to be non-nil.");
+      }
+      return;
+    }
+    found = cachedOnQueue(record.uuid);
+    if (!found) found = createPlugInForProxy(record);
   });
   return found;
 }
 
-std::shared_ptr<const QVDPlugIn> QVDatabase::findPlugInAtPath(std::string_view url) {
-  std::optional<std::string> path = QVPathFromFileURL(url);
-  if (!path) {
-    QVLogTraffic().info("not a file URL: %{public}s", std::string(url));
-    return nullptr;
+std::shared_ptr<QVDPlugIn> QVDatabase::createPlugInForProxy(
+    const platform::holvane::PlugInRecord& record) {
+  QV_ASSERT_ON_QUEUE(sync_);
+  QVLogOps().notice("createPlugInForProxy");
+  if (!plugInServices_.registry) return nullptr;  // initDatabase() did not succeed
+  std::shared_ptr<QVDPlugIn> plugIn = QVDPlugIn::initWithHVData(record, plugInServices_);
+  if (!plugIn) return nullptr;
+  if (plugIn->hasEntitlement(QVAutoElectEntitlement)) autoElect(*plugIn);
+  purgeCachesToLimit(cacheLimit());
+  cache_->store(plugIn);
+  return plugIn;
+}
+
+void QVDatabase::purgeCachesToLimit(std::uint64_t limit) {
+  QV_ASSERT_ON_QUEUE(sync_);
+  // The registration service keeps no schema caches in process, so the
+  // cache's own entries are all there is to drop.
+  cache_->purgeToLimit(limit);
+}
+
+void QVDatabase::autoElect(const QVDPlugIn& plugIn) {
+  QV_ASSERT_ON_QUEUE(sync_);
+  if (!annotations_) return;
+  platform::Dictionary annotation =
+      annotations_->annotationForPlugIn(plugIn).value_or(platform::Dictionary());
+  if (const platform::Value* election = annotation.find(QVAnnotationElectionKey)) {
+    // An election the user made (or -1, "never") is kept; only 0 or none
+    // is raised.
+    if (electionInteger(*election) != 0) return;
   }
-  std::shared_ptr<const QVDPlugIn> found;
-  sync_->sync([&] {
-    auto it = byPath_.find(*path);
-    if (it != byPath_.end()) found = it->second;
-  });
-  return found;
+  annotation.set(QVAnnotationElectionKey, platform::Value(1));
+  annotations_->setAnnotationForPlugIn(std::move(annotation), plugIn);
 }
 
-void QVDatabase::addPlugInForTesting(std::shared_ptr<const QVDPlugIn> plugIn) {
-  const std::optional<platform::Uuid> uuid = plugIn ? plugIn->uuid() : std::nullopt;
-  const std::optional<std::string> path = plugIn ? plugIn->path() : std::nullopt;
-  // A built plug-in always has both; anything else cannot be looked up.
-  if (!uuid || !path) return;
-  sync_->sync([&] {
-    byUuid_[uuid->toString()] = plugIn;
-    byPath_[*path] = plugIn;
-  });
+std::size_t QVDatabase::cacheCount() const {
+  std::size_t count = 0;
+  sync_->sync([&] { count = cache_->count(); });
+  return count;
 }
 
 }  // namespace qvd

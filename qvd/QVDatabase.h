@@ -1,32 +1,60 @@
-// The plug-in database: the daemon's view of which plug-ins exist, with a
-// cache of their records and the annotation store. The server is a database
-// (it derives from this class) extended with the network-facing service.
+// The plug-in database: the daemon's view of which plug-ins exist. The
+// registration service is the source of truth; the database turns its
+// records into plug-in objects and keeps them in a cache keyed by plug-in
+// UUID, so that repeated look-ups of one plug-in share one object. It also
+// owns the annotation store. The server is a database (it derives from this
+// class) extended with the network-facing service.
 //
-// For now this is the shell the server stands on: it keeps its settings
-// (annotation file location, cache limit) and its own serial queue, and knows
-// no plug-ins; the registry fills in the look-ups.
+// The cache is emptied when it has grown past the cache limit at the moment
+// of a creation, after every change of the current locale (names are
+// localized), and loses a plug-in's entry when that plug-in is uninstalled.
 //
-// Thread safety: the look-ups and settings may be called from any queue;
-// the cache is confined to the database's own queue ("QVDatabase").
+// Thread safety: the look-ups and settings may be called from any queue
+// except the database's own ("QVDatabase"), which they wait on; the cache
+// is confined to that queue.
 #pragma once
 
 #include <atomic>
 #include <cstdint>
 #include <memory>
-#include <mutex>
 #include <optional>
 #include <string>
 #include <string_view>
-#include <unordered_map>
+#include <unordered_set>
+#include <vector>
 
+#include "Quorvex/QVPlugInCore.h"
 #include "platform/dispatch/SerialQueue.h"
+#include "platform/holvane/RegistrationRecord.h"
+#include "platform/holvane/Registry.h"
+#include "platform/notify/ObservationHandle.h"
+#include "platform/values/Dictionary.h"
 #include "platform/values/Result.h"
 #include "platform/values/Uuid.h"
-#include "platform/container/ContainerManager.h"
+#include "qvd/Platform.h"
 #include "qvd/QVDAnnotationStore.h"
 #include "qvd/QVDPlugIn.h"
+#include "qvd/QVDPlugInCache.h"
 
 namespace qvd {
+
+// Plug-ins as a set: members are equal when their UUIDs are.
+using QVDPlugInSet =
+    std::unordered_set<std::shared_ptr<QVDPlugIn>, QVPlugInCoreHash, QVPlugInCoreEqual>;
+
+// The election list of a query: the normalised "XOUserElection" value, or
+// none (no election filtering). A list with an element that cannot be
+// normalised, a text that cannot, and any other kind give none.
+std::optional<std::vector<std::string>> electionListFromQuery(const platform::Dictionary& query);
+// One element: "=x" gives "x"; a text starting with a letter, mark or
+// number stands for itself; anything else (and "") fails.
+std::optional<std::string> normalizedElection(const platform::Value& element);
+// The integer of an election value: reals are truncated toward zero, and a
+// value that is no number (or a real out of range) counts as 0.
+std::int64_t electionInteger(const platform::Value& election);
+// The election key of a value: its integer's low 8 bits, unsigned, in
+// decimal ("255" for -1).
+std::string electionKey(const platform::Value& election);
 
 class QVDatabase {
  public:
@@ -34,12 +62,46 @@ class QVDatabase {
   QVDatabase(const QVDatabase&) = delete;
   QVDatabase& operator=(const QVDatabase&) = delete;
 
-  // The plug-in with `uuid`, or none.
-  virtual std::shared_ptr<const QVDPlugIn> findPlugIn(const platform::Uuid& uuid);
-  // The plug-in whose bundle lies at the file URL `url`, or none.
-  virtual std::shared_ptr<const QVDPlugIn> findPlugInAtPath(std::string_view url);
+  // ---- The cache (QVDatabase.cpp) ----
 
-  // The number of plug-in records the cache may hold. -c sets it at start.
+  // The cached plug-in of `record`, else a new one (then cached). None when
+  // the record yields no plug-in; nothing is cached then.
+  // REQUIRES: not on syncQueue().
+  std::shared_ptr<QVDPlugIn> plugInForProxy(const platform::holvane::PlugInRecord& record);
+  // A new plug-in built from `record`, stored in the cache after the purge
+  // rule has been applied; none (cache untouched) when it cannot be built.
+  // REQUIRES: on syncQueue().
+  std::shared_ptr<QVDPlugIn> createPlugInForProxy(const platform::holvane::PlugInRecord& record);
+  // Empties the cache when it holds more than `limit` entries.
+  // REQUIRES: on syncQueue().
+  void purgeCachesToLimit(std::uint64_t limit);
+  // Gives a plug-in carrying the auto-elect entitlement the election 1,
+  // unless it has a non-zero election already.
+  // REQUIRES: on syncQueue().
+  void autoElect(const QVDPlugIn& plugIn);
+  // The number of cached plug-ins (waits on syncQueue()).
+  std::size_t cacheCount() const;
+
+  // ---- The queries (QVDatabaseQueries.cpp) ----
+
+  // The plug-ins the registration service selects for `query`, narrowed by
+  // the user's elections when the query's "XOUserElection" asks for it.
+  // An absent or empty query lists every plug-in, ignoring elections.
+  // None when the service answered no list.
+  std::optional<QVDPlugInSet> findPlugIns(const std::optional<platform::Dictionary>& query);
+  // The plug-in with `uuid`, or none.
+  virtual std::shared_ptr<QVDPlugIn> findPlugIn(const platform::Uuid& uuid);
+  // The plug-in whose bundle lies at the file URL `url`, or none.
+  virtual std::shared_ptr<QVDPlugIn> findPlugInAtPath(std::string_view url);
+  // The plug-ins inside the application at the file URL `url`, in the
+  // service's order; none (not an empty list) when it has none.
+  std::optional<std::vector<std::shared_ptr<QVDPlugIn>>> plugInsWithinApplication(
+      std::string_view url);
+
+  // ---- Settings ----
+
+  // A creation that finds more than this many cached plug-ins empties the
+  // cache first. -c sets it at start.
   void setCacheLimit(std::uint64_t limit) { cacheLimit_.store(limit); }
   std::uint64_t cacheLimit() const { return cacheLimit_.load(); }
 
@@ -52,28 +114,33 @@ class QVDatabase {
   // The database's own serial queue, "QVDatabase".
   const std::shared_ptr<platform::dispatch::SerialQueue>& syncQueue() const { return sync_; }
 
-  // Makes `plugIn` known to the look-ups, until the registry provides them.
-  // A null plug-in, or one without uuid or path, is ignored.
-  void addPlugInForTesting(std::shared_ptr<const QVDPlugIn> plugIn);
-
   static constexpr std::uint64_t kDefaultCacheLimit = 1000000;
 
  protected:
   QVDatabase();
   // The database part of the server's construction: loads the annotation
-  // store from `databasePath` (none: its default location). Fails only when
-  // no annotation location can be had at all (the user container lookup).
-  platform::Status initDatabase(std::optional<std::string> databasePath,
-                                std::shared_ptr<platform::container::ContainerManager> containers);
+  // store from `databasePath` (none: its default location), then observes
+  // the registration service's uninstalls and the locale. Fails when no
+  // annotation location can be had at all (the user container lookup), or
+  // when a service the database needs is missing. A locale that cannot be
+  // observed is logged only.
+  platform::Status initDatabase(std::optional<std::string> databasePath, const Platform& services);
 
  private:
+  // Runs on sync_: the valid cached entry of `uuid`, else the key is
+  // dropped and none answered.
+  std::shared_ptr<QVDPlugIn> cachedOnQueue(const platform::Uuid& uuid);
+
   std::optional<std::string> databasePath_;
   std::unique_ptr<QVDAnnotationStore> annotations_;
   std::atomic<std::uint64_t> cacheLimit_{kDefaultCacheLimit};
   const std::shared_ptr<platform::dispatch::SerialQueue> sync_;
-  // Touched only on sync_.
-  std::unordered_map<std::string, std::shared_ptr<const QVDPlugIn>> byUuid_;
-  std::unordered_map<std::string, std::shared_ptr<const QVDPlugIn>> byPath_;
+  // Shared with the observers, which hold it weakly: a notice that arrives
+  // after the database is gone finds nothing to change.
+  const std::shared_ptr<QVDPlugInCache> cache_;
+  std::shared_ptr<platform::holvane::Registry> registry_;
+  QVDPlugIn::Services plugInServices_;
+  platform::notify::ObservationHandle regionObserver_;
 };
 
 }  // namespace qvd

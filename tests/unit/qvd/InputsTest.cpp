@@ -8,10 +8,7 @@
 #include <fstream>
 
 #include "Quorvex/QVDConstants.h"
-#include "platform/holvane/testing/FakeRegistry.h"
-#include "platform/locale/testing/FakeLocaleService.h"
 #include "platform/root/Root.h"
-#include "platform/sandbox/testing/FakeSandboxExtensions.h"
 #include "qvd/Transaction.h"
 #include "tests/unit/qvd/QvdTestSupport.h"
 
@@ -65,9 +62,10 @@ class InputsTest : public ::testing::Test {
     return reply.ok() ? *reply : Value();
   }
 
-  // A real plug-in built from a registration record at `path` (a service
-  // plug-in with a data container, so that it passes validation).
-  std::shared_ptr<const QVDPlugIn> plugInFromRecord(const std::string& path) {
+  // Registers a plug-in at `path` with the server's registration service
+  // (a service plug-in with a data container, so that it passes validation)
+  // and answers its UUID.
+  Uuid registerPlugIn(const std::string& path) {
     platform::holvane::PlugInRecord record;
     record.uuid = Uuid::generate();
     record.path = path;
@@ -76,16 +74,12 @@ class InputsTest : public ::testing::Test {
     record.info = Dictionary{
         {"XOExtension", Dictionary{{"XOExtensionProtocol", "p"},
                                    {"XOExtensionAttributes", Dictionary{}}}}};
-    registry_->put(record);
-    return QVDPlugIn::initWithHVData(
-        record, {registry_, std::make_shared<platform::locale::FakeLocaleService>(),
-                 std::make_shared<platform::sandbox::FakeSandboxExtensions>()});
+    server_.fakes().registry->put(record);
+    return record.uuid;
   }
 
   TestServer server_;
   std::string dir_;
-  std::shared_ptr<platform::holvane::FakeRegistry> registry_ =
-      std::make_shared<platform::holvane::FakeRegistry>();
 };
 
 TEST_F(InputsTest, Paths) {
@@ -125,13 +119,8 @@ TEST_F(InputsTest, Uuids) {
   const Uuid unknown = Uuid::generate();
   const std::string knownPath = platform::rootPath("System/Known.ovx");
   const std::string byPathPath = platform::rootPath("System/ByPath.ovx");
-  auto knownPlugIn = plugInFromRecord(knownPath);
-  auto byPathPlugIn = plugInFromRecord(byPathPath);
-  ASSERT_NE(knownPlugIn, nullptr);
-  ASSERT_NE(byPathPlugIn, nullptr);
-  const Uuid known = *knownPlugIn->uuid();
-  server_.server()->addPlugInForTesting(knownPlugIn);
-  server_.server()->addPlugInForTesting(byPathPlugIn);
+  const Uuid known = registerPlugIn(knownPath);
+  registerPlugIn(byPathPath);
   struct Case {
     const char* what;
     Value uuids;

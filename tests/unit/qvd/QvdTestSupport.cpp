@@ -36,6 +36,9 @@ Platform FakePlatform::platform() const {
   services.preferences = preferences;
   services.notifications = notifications;
   services.containers = containers;
+  services.registry = registry;
+  services.locale = locale;
+  services.extensions = extensions;
   return services;
 }
 

@@ -13,10 +13,13 @@
 
 #include "platform/codesign/testing/FakeEntitlementStore.h"
 #include "platform/container/testing/FakeContainerManager.h"
+#include "platform/holvane/testing/FakeRegistry.h"
+#include "platform/locale/testing/FakeLocaleService.h"
 #include "platform/mbx/Connection.h"
 #include "platform/notify/testing/FakeNotificationCenter.h"
 #include "platform/prefs/testing/FakePreferenceStore.h"
 #include "platform/sandbox/testing/FakeSandboxCheck.h"
+#include "platform/sandbox/testing/FakeSandboxExtensions.h"
 #include "platform/values/Dictionary.h"
 #include "qvd/QVDMbxClient.h"
 #include "qvd/QVDServer.h"
@@ -37,6 +40,12 @@ struct FakePlatform {
       std::make_shared<platform::notify::FakeNotificationCenter>();
   std::shared_ptr<platform::container::FakeContainerManager> containers =
       std::make_shared<platform::container::FakeContainerManager>();
+  std::shared_ptr<platform::holvane::FakeRegistry> registry =
+      std::make_shared<platform::holvane::FakeRegistry>();
+  std::shared_ptr<platform::locale::FakeLocaleService> locale =
+      std::make_shared<platform::locale::FakeLocaleService>();
+  std::shared_ptr<platform::sandbox::FakeSandboxExtensions> extensions =
+      std::make_shared<platform::sandbox::FakeSandboxExtensions>();
   Platform platform() const;
 };
 
