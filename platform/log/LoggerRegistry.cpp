@@ -75,4 +75,9 @@ const Logger& defaultLog() {
   return LoggerRegistry::shared().defaultLog();
 }
 
+const Logger& platformLog(std::string_view category) {
+  auto made = LoggerRegistry::shared().logger("com.corvane.platform", category);
+  return made.ok() ? **made : defaultLog();
+}
+
 }  // namespace platform::log

@@ -72,4 +72,10 @@ class LoggerRegistry {
 // LoggerRegistry::shared().defaultLog().
 const Logger& defaultLog();
 
+// The log of a category of the platform's own subsystem
+// ("com.corvane.platform"); the default log when the registry refuses it
+// (it is full: the default log then still carries the lines). Callers keep
+// the reference in a function-local static.
+const Logger& platformLog(std::string_view category);
+
 }  // namespace platform::log

@@ -5,12 +5,7 @@
 namespace platform::codesign::internal {
 
 const log::Logger& codesignLog() {
-  // The names are valid constants, so the registry only fails when it is
-  // full; the default log then still carries the reasons.
-  static const log::Logger& logger = []() -> const log::Logger& {
-    auto made = log::LoggerRegistry::shared().logger("com.corvane.platform", "codesign");
-    return made.ok() ? **made : log::defaultLog();
-  }();
+  static const log::Logger& logger = log::platformLog("codesign");
   return logger;
 }
 

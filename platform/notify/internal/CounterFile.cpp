@@ -20,10 +20,7 @@ namespace {
 constexpr std::size_t kMaxCounterBytes = 21;
 
 const log::Logger& notifyLog() {
-  static const log::Logger& logger = []() -> const log::Logger& {
-    auto made = log::LoggerRegistry::shared().logger("com.corvane.platform", "notify");
-    return made.ok() ? **made : log::defaultLog();
-  }();
+  static const log::Logger& logger = log::platformLog("notify");
   return logger;
 }
 

@@ -22,10 +22,7 @@ constexpr std::uint32_t kWatchMask =
 constexpr int kMaxReadsPerWakeup = 16;
 
 const log::Logger& notifyLog() {
-  static const log::Logger& logger = []() -> const log::Logger& {
-    auto made = log::LoggerRegistry::shared().logger("com.corvane.platform", "notify");
-    return made.ok() ? **made : log::defaultLog();
-  }();
+  static const log::Logger& logger = log::platformLog("notify");
   return logger;
 }
 

@@ -19,10 +19,7 @@ std::int64_t nanoseconds(const struct timespec& t) {
 }
 
 const log::Logger& prefsLog() {
-  static const log::Logger& logger = []() -> const log::Logger& {
-    auto made = log::LoggerRegistry::shared().logger("com.corvane.platform", "prefs");
-    return made.ok() ? **made : log::defaultLog();
-  }();
+  static const log::Logger& logger = log::platformLog("prefs");
   return logger;
 }
 

@@ -5,10 +5,7 @@
 namespace platform::sandbox::internal {
 
 const log::Logger& sandboxLog() {
-  static const log::Logger& logger = []() -> const log::Logger& {
-    auto made = log::LoggerRegistry::shared().logger("com.corvane.platform", "sandbox");
-    return made.ok() ? **made : log::defaultLog();
-  }();
+  static const log::Logger& logger = log::platformLog("sandbox");
   return logger;
 }
 
