@@ -24,9 +24,8 @@ namespace qvd::integration {
 namespace {
 
 std::string readWhole(const std::string& path) {
-  std::ifstream in(path, std::ios::binary);
   std::stringstream text;
-  text << in.rdbuf();
+  text << std::ifstream(path, std::ios::binary).rdbuf();
   return text.str();
 }
 
@@ -38,11 +37,8 @@ std::vector<char*> pointers(std::vector<std::string>& strings) {
 }
 
 // Starts `argv` with its stdout and stderr sent to files.
-pid_t spawn(std::vector<std::string> argv, const std::string& root,
-            const std::vector<std::string>& extraEnv, const std::string& outPath,
+pid_t spawn(std::vector<std::string> argv, std::vector<std::string> env, const std::string& outPath,
             const std::string& errPath) {
-  std::vector<std::string> env = {"QV_ROOT=" + root, "PATH=/usr/bin:/bin"};
-  env.insert(env.end(), extraEnv.begin(), extraEnv.end());
   posix_spawn_file_actions_t actions;
   posix_spawn_file_actions_init(&actions);
   posix_spawn_file_actions_addopen(&actions, 0, "/dev/null", O_RDONLY, 0);
@@ -87,10 +83,8 @@ std::atomic<int> gSerial{0};
 
 }  // namespace
 
-TemporaryRoot::TemporaryRoot() {
-  char pattern[] = "/tmp/qvd-it-XXXXXX";
-  const char* made = ::mkdtemp(pattern);
-  path_ = made != nullptr ? made : "/tmp";
+TemporaryRoot::TemporaryRoot() : path_("/tmp/qvd-it-XXXXXX") {
+  if (::mkdtemp(path_.data()) == nullptr) std::abort();
 }
 
 TemporaryRoot::~TemporaryRoot() {
@@ -98,11 +92,10 @@ TemporaryRoot::~TemporaryRoot() {
   std::filesystem::remove_all(path_, ignored);
 }
 
-Finished runProcess(const std::vector<std::string>& argv, const std::string& root,
-                    const std::vector<std::string>& extraEnv) {
+Finished runProcess(const std::vector<std::string>& argv, const std::string& root) {
   const std::string stem = root + "/.run-" + std::to_string(++gSerial);
   Finished finished;
-  pid_t pid = spawn(argv, root, extraEnv, stem + ".out", stem + ".err");
+  pid_t pid = spawn(argv, {"QV_ROOT=" + root, "PATH=/usr/bin:/bin"}, stem + ".out", stem + ".err");
   if (pid < 0) return finished;
   finished.status = waitFor(pid, 10s);
   finished.out = readWhole(stem + ".out");
@@ -114,8 +107,9 @@ Daemon::Daemon(const TemporaryRoot& root, std::vector<std::string> arguments,
                std::string serviceName)
     : root_(root), serviceName_(std::move(serviceName)), logPath_(root / "qvd.log") {
   arguments.insert(arguments.begin(), QVD_PATH);
-  pid_ = spawn(arguments, root.path(), {"QV_LOG=debug", "QV_LOG_PRIVATE=1"}, root / "qvd.out",
-               logPath_);
+  pid_ = spawn(arguments,
+               {"QV_ROOT=" + root.path(), "PATH=/usr/bin:/bin", "QV_LOG=debug", "QV_LOG_PRIVATE=1"},
+               root / "qvd.out", logPath_);
 }
 
 Daemon::~Daemon() {
@@ -164,16 +158,14 @@ int Daemon::countLines(const std::string& text) const {
   return count;
 }
 
-std::string requestClientPath() { return REQUEST_CLIENT_PATH; }
-
 ClientRun sendRequest(const TemporaryRoot& root, const platform::Value& request,
-                      std::vector<std::string> options, const std::string& clientPath) {
+                      std::vector<std::string> options) {
   ClientRun run;
   const std::string file = root / (".request-" + std::to_string(++gSerial) + ".vmap");
   auto text = platform::vmap::write(request, platform::vmap::Format::Xml);
   if (!text.ok()) return run;
   std::ofstream(file) << *text;
-  std::vector<std::string> argv{clientPath.empty() ? requestClientPath() : clientPath};
+  std::vector<std::string> argv{REQUEST_CLIENT_PATH};
   argv.insert(argv.end(), options.begin(), options.end());
   argv.push_back(file);
   run.finished = runProcess(argv, root.path());

@@ -14,21 +14,17 @@ namespace qvd::integration {
 
 using namespace std::chrono_literals;
 
-// What a finished process left: its exit status (or 128 + signal) and what
-// it wrote.
+// A finished process: its exit status (or 128 + signal) and what it wrote.
 struct Finished {
   int status = -1;
   std::string out;
   std::string err;
 };
 
-// A directory under /tmp, removed at the end.
 class TemporaryRoot {
  public:
   TemporaryRoot();
   ~TemporaryRoot();
-  TemporaryRoot(const TemporaryRoot&) = delete;
-  TemporaryRoot& operator=(const TemporaryRoot&) = delete;
   const std::string& path() const { return path_; }
   std::string operator/(const std::string& relative) const { return path_ + "/" + relative; }
 
@@ -36,10 +32,9 @@ class TemporaryRoot {
   std::string path_;
 };
 
-// Runs `argv` with QV_ROOT=root (and `extraEnv`), waits for it (10 s at
-// most: then it is killed) and collects its output.
-Finished runProcess(const std::vector<std::string>& argv, const std::string& root,
-                    const std::vector<std::string>& extraEnv = {});
+// Runs `argv` with QV_ROOT=root, waits for it (killed after 10 s) and
+// collects its output.
+Finished runProcess(const std::vector<std::string>& argv, const std::string& root);
 
 // A qvd process with its log (all levels, nothing redacted) in a file.
 class Daemon {
@@ -47,19 +42,13 @@ class Daemon {
   Daemon(const TemporaryRoot& root, std::vector<std::string> arguments,
          std::string serviceName = "com.corvane.quorvex.qvd");
   ~Daemon();
-  Daemon(const Daemon&) = delete;
-  Daemon& operator=(const Daemon&) = delete;
-
-  // Waits until the daemon accepts connections (false after 10 s or when it
-  // exited).
+  // Waits until it accepts connections (false after 10 s or when it exited).
   bool waitUntilServing();
   // Sends SIGTERM and waits for the exit: its status, or -1.
   int terminate();
-  // The log so far.
   std::string log() const;
   // How many lines of the log contain `text`.
   int countLines(const std::string& text) const;
-  pid_t pid() const { return pid_; }
 
  private:
   const TemporaryRoot& root_;
@@ -75,10 +64,6 @@ struct ClientRun {
   platform::Value reply;
 };
 ClientRun sendRequest(const TemporaryRoot& root, const platform::Value& request,
-                      std::vector<std::string> options = {},
-                      const std::string& clientPath = "");
-
-// The request client's path (built next to the tests).
-std::string requestClientPath();
+                      std::vector<std::string> options = {});
 
 }  // namespace qvd::integration

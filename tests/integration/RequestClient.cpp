@@ -1,13 +1,9 @@
-// A client process for the daemon's integration tests. It sends the request
-// in a vmap file to the daemon, as often as asked, and prints the last reply
-// as vmap XML on stdout.
-//
+// Sends the request in a vmap file to the daemon, as often as asked, and
+// prints the last reply as vmap XML:
 //   qvd_request_client [--service NAME] [--count N] [--memfd] REQUEST.vmap
-//
-// --memfd first runs the program again from an anonymous memory file, so
-// that the daemon cannot find its executable on any file system.
-// Exit status: 0 with a reply, 3 when the connection failed (the error on
-// stderr), 2 for a bad command line or request file.
+// --memfd re-runs it from an anonymous memory file, so that the daemon cannot
+// find its executable. Exit: 0 with a reply, 3 when the connection failed,
+// 2 for a bad command line or request file.
 #include <sys/mman.h>
 #include <unistd.h>
 
@@ -26,7 +22,6 @@
 
 namespace {
 
-// Runs this program again, from a copy in an anonymous memory file.
 [[noreturn]] void reexecFromMemfd(std::vector<char*> argv) {
   std::ifstream self("/proc/self/exe", std::ios::binary);
   std::string image((std::istreambuf_iterator<char>(self)), std::istreambuf_iterator<char>());

@@ -1,7 +1,5 @@
-// The child of the crash test: opens the store on the file named by its
-// argument and adds one annotation after another, saving after each, until
-// it is killed. "ready" on stdout after the first save tells the test that
-// killing it now interrupts saves and not start-up.
+// The child of the crash test: adds annotations to the store at argv[1],
+// saving after each, until killed; "ready" on stdout after the first save.
 #include <unistd.h>
 
 #include <cstdio>
@@ -13,31 +11,20 @@
 
 namespace {
 
-class Named final : public qvd::QVDAnnotated {
- public:
-  explicit Named(std::string key) : key_(std::move(key)) {}
-  std::string annotationKey() const override { return key_; }
-
- private:
-  std::string key_;
+struct Named final : qvd::QVDAnnotated {
+  explicit Named(std::string k) : key(std::move(k)) {}
+  std::string annotationKey() const override { return key; }
+  std::string key;
 };
-
 }  // namespace
 
 int main(int argc, char** argv) {
-  if (argc != 2) {
-    std::fprintf(stderr, "usage: %s FILE\n", argv[0]);
-    return 2;
-  }
+  if (argc != 2) return 2;
   auto made = qvd::QVDAnnotationStore::initWithDatabase(
       std::string(argv[1]), std::make_shared<platform::container::FakeContainerManager>());
-  if (!made.ok()) {
-    std::fprintf(stderr, "%s\n", made.error().description().c_str());
-    return 1;
-  }
+  if (!made.ok()) return 1;
   qvd::QVDAnnotationStore& store = **made;
-  // Padding makes each file several pages long, so a kill can land in the
-  // middle of writing one.
+  // Padding makes each file several pages long, so a kill can land mid-write.
   const std::string padding(512, 'x');
   bool announced = false;
   for (std::size_t n = store.annotations().size();; ++n) {

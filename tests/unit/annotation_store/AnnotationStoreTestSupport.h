@@ -1,5 +1,4 @@
-// Helpers shared by the annotation store tests: a scratch directory, plug-ins
-// that answer a chosen annotation key, and file contents in and out.
+// Helpers shared by the annotation store tests.
 #pragma once
 
 #include <gtest/gtest.h>
@@ -15,7 +14,6 @@
 #include "qvd/QVDAnnotated.h"
 
 namespace platform {
-// Readable values in failure messages.
 inline void PrintTo(const Value& value, std::ostream* out) { *out << value.description(); }
 inline void PrintTo(const Dictionary& value, std::ostream* out) {
   *out << Value(value).description();
@@ -24,22 +22,15 @@ inline void PrintTo(const Dictionary& value, std::ostream* out) {
 
 namespace qvd::testing {
 
-// A fresh directory, removed with everything in it afterwards.
 class ScratchDirectory {
  public:
-  ScratchDirectory() {
-    std::string pattern =
-        (std::filesystem::temp_directory_path() / "annotation-store-XXXXXX").string();
-    if (::mkdtemp(pattern.data()) == nullptr) ADD_FAILURE() << "mkdtemp " << pattern;
-    path_ = pattern;
+  ScratchDirectory() : path_((std::filesystem::temp_directory_path() / "annot-XXXXXX").string()) {
+    if (::mkdtemp(path_.data()) == nullptr) ADD_FAILURE() << "mkdtemp " << path_;
   }
   ~ScratchDirectory() {
-    std::error_code ec;
-    std::filesystem::remove_all(path_, ec);
+    std::error_code ignored;
+    std::filesystem::remove_all(path_, ignored);
   }
-  ScratchDirectory(const ScratchDirectory&) = delete;
-  ScratchDirectory& operator=(const ScratchDirectory&) = delete;
-
   const std::string& path() const { return path_; }
 
  private:
@@ -56,35 +47,27 @@ class FakePlugIn final : public QVDAnnotated {
 };
 
 inline void writeText(const std::string& path, const std::string& text) {
-  std::ofstream out(path, std::ios::binary | std::ios::trunc);
-  out << text;
-  ASSERT_TRUE(out.good()) << path;
+  std::ofstream(path, std::ios::binary | std::ios::trunc) << text;
 }
 
 inline std::string readText(const std::string& path) {
-  std::ifstream in(path, std::ios::binary);
   std::ostringstream text;
-  text << in.rdbuf();
+  text << std::ifstream(path, std::ios::binary).rdbuf();
   return text.str();
 }
 
-// An XML document holding `root`, written out by hand so that the tests do
-// not depend on the store's own writer for their inputs.
+// An XML document holding `root`, written by hand, not by the store's writer.
 inline std::string vmapDocument(const std::string& root) {
   return "<?xml version=\"1.0\" encoding=\"UTF-8\"?>\n<vmap version=\"1.0\">\n" + root +
          "\n</vmap>\n";
 }
 
-// The root dictionary of the document at `path`, failing the test when the
-// file is not a complete document with a dictionary root.
+// The dictionary root of the document at `path`; fails the test otherwise.
 inline platform::Dictionary rootOf(const std::string& path) {
   platform::Result<platform::Value> root = platform::vmap::readFile(path);
-  if (!root.ok()) {
-    ADD_FAILURE() << root.error().description();
-    return {};
-  }
-  if (root->dictionary() == nullptr) {
-    ADD_FAILURE() << path << " holds " << root->description();
+  if (!root.ok() || root->dictionary() == nullptr) {
+    ADD_FAILURE() << path << (root.ok() ? " holds " + root->description()
+                                        : ": " + root.error().description());
     return {};
   }
   return *root->dictionary();

@@ -2,6 +2,7 @@
 #pragma once
 
 #include <cstdint>
+#include <cstdio>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -22,13 +23,10 @@ inline std::vector<std::uint8_t> hexBytes(std::string_view hex) {
 }
 
 inline std::string toHex(const std::vector<std::uint8_t>& bytes) {
-  static constexpr char kDigits[] = "0123456789abcdef";
   std::string out;
-  for (std::uint8_t b : bytes) {
-    if (!out.empty()) out.push_back(' ');
-    out.push_back(kDigits[b >> 4]);
-    out.push_back(kDigits[b & 15]);
-  }
+  char buf[4];
+  for (std::uint8_t b : bytes)
+    out += (std::snprintf(buf, sizeof buf, "%s%02x", out.empty() ? "" : " ", b), buf);
   return out;
 }
 

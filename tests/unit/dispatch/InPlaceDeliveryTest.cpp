@@ -5,12 +5,9 @@
 #include <sys/eventfd.h>
 #include <unistd.h>
 
-#include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
 #include <atomic>
-#include <memory>
-#include <string>
 #include <thread>
 #include <vector>
 
@@ -25,7 +22,6 @@ namespace {
 
 using namespace std::chrono_literals;
 using internal::ThreadPool;
-using ::testing::ElementsAre;
 
 // An eventfd watched by a source; closed once the source is cancelled.
 struct Counter {
@@ -113,50 +109,6 @@ TEST(DispatchInPlaceDelivery, AHandlerRunInPlaceIsAnItemOfItsQueue) {
   EXPECT_TRUE(syncRan);
   EXPECT_FALSE(exclusion.overlapped);
   finish(source);
-}
-
-TEST(DispatchInPlaceDelivery, ABusyQueueGetsItsEventsInOrderBehindItsWork) {
-  auto queue = SerialQueue::create("test.inplace.busy");
-  Counter first, second;
-  Exclusion exclusion;
-  std::vector<std::string> log;  // touched only on the queue
-  Semaphore started, gate;
-  auto record = [&](const char* entry) {
-    exclusion.enter();
-    log.push_back(entry);
-    exclusion.leave();
-  };
-  queue->async([&] {
-    exclusion.enter();
-    started.signal();
-    gate.wait();
-    log.push_back("busy");
-    exclusion.leave();
-  });
-  ASSERT_EQ(started.waitFor(5s), WaitResult::Succeeded);
-  auto a = watch(first, queue, [&] {
-    first.take();
-    record("first");
-  });
-  auto b = watch(second, queue, [&] {
-    second.take();
-    record("second");
-  });
-  ASSERT_TRUE(a && b);
-  // Each event is queued behind what the queue already has, and each item
-  // posted after an event was queued comes after it.
-  first.bump();
-  ASSERT_TRUE(testing::eventually([&] { return queue->pendingCountForTesting() == 1; }));
-  queue->async([&] { record("between"); });
-  second.bump();
-  ASSERT_TRUE(testing::eventually([&] { return queue->pendingCountForTesting() == 3; }));
-  queue->async([&] { record("last"); });
-  gate.signal();
-  queue->sync([] {});
-  queue->sync([&] { EXPECT_THAT(log, ElementsAre("busy", "first", "between", "second", "last")); });
-  EXPECT_FALSE(exclusion.overlapped);
-  finish(a);
-  finish(b);
 }
 
 TEST(DispatchInPlaceDelivery, EventsAreSeenWhileTheOnlyRunningThreadBlocksInAHandler) {

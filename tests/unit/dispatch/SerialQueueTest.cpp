@@ -7,6 +7,8 @@
 #include <thread>
 #include <vector>
 
+#include "platform/dispatch/ConcurrentQueue.h"
+#include "platform/dispatch/Group.h"
 #include "platform/dispatch/Semaphore.h"
 #include "tests/unit/dispatch/TestSupport.h"
 
@@ -22,8 +24,7 @@ TEST(DispatchSerialQueue, KeepsSubmissionOrderAndExclusionUnderContention) {
   constexpr int kPerProducer = 3000;
   std::vector<int> lastSeen(kProducers, -1);  // touched only on the queue
   std::atomic<int> inside{0};
-  std::atomic<bool> overlapped{false};
-  std::atomic<bool> outOfOrder{false};
+  std::atomic<bool> overlapped{false}, outOfOrder{false};
   Semaphore done;
 
   std::vector<std::thread> producers;
@@ -47,73 +48,6 @@ TEST(DispatchSerialQueue, KeepsSubmissionOrderAndExclusionUnderContention) {
   EXPECT_FALSE(overlapped);
   EXPECT_FALSE(outOfOrder);
   for (int p = 0; p < kProducers; ++p) EXPECT_EQ(lastSeen[p], kPerProducer - 1);
-}
-
-TEST(DispatchSerialQueue, BusyQueueYieldsToOthersAfterABatch) {
-  // One pool thread: only yielding lets the second queue in before the
-  // first has drained its whole backlog.
-  ScopedPoolLimits limits({.target = 1, .cap = 512, .idleRetire = 10s});
-  auto busy = SerialQueue::create("test.busy");
-  auto other = SerialQueue::create("test.other");
-  constexpr int kBacklog = 2000;
-  std::atomic<int> busyRan{0};
-  std::atomic<int> busyRanWhenOtherRan{-1};
-  std::atomic<bool> release{false};
-  Semaphore done, otherDone;
-  // Spins rather than waits: a wait marked as blocking would let the pool
-  // start a second thread and hide the yielding.
-  busy->async([&] {
-    while (!release) std::this_thread::yield();
-  });
-  for (int i = 0; i < kBacklog; ++i) {
-    busy->async([&] {
-      if (busyRan.fetch_add(1) + 1 == kBacklog) done.signal();
-    });
-  }
-  other->async([&] {
-    busyRanWhenOtherRan = busyRan.load();
-    otherDone.signal();
-  });
-  release = true;
-  ASSERT_EQ(done.waitFor(10s), WaitResult::Succeeded);
-  ASSERT_EQ(otherDone.waitFor(10s), WaitResult::Succeeded);
-  EXPECT_GE(busyRanWhenOtherRan.load(), 0);
-  EXPECT_LE(busyRanWhenOtherRan.load(), 2 * SerialQueue::kBatchLimit);
-}
-
-TEST(DispatchSerialQueue, HigherPriorityQueuesGetThePoolFirst) {
-  ScopedPoolLimits limits({.target = 1, .cap = 512, .idleRetire = 10s});
-  auto blocker = SerialQueue::create("test.blocker");
-  auto low = SerialQueue::create("test.low", Priority::Background);
-  auto mid = SerialQueue::create("test.mid", Priority::Default);
-  auto high = SerialQueue::create("test.high", Priority::UserInteractive);
-  std::vector<std::string> order;  // appended to by one pool thread at a time
-  std::mutex mu;
-  std::atomic<bool> release{false};
-  Semaphore started, done;
-  // Occupies the only running slot without being marked as blocking.
-  blocker->async([&] {
-    started.signal();
-    while (!release) std::this_thread::yield();
-  });
-  ASSERT_EQ(started.waitFor(5s), WaitResult::Succeeded);
-  auto record = [&](const char* name) {
-    return [&, name] {
-      bool last;
-      {
-        std::lock_guard<std::mutex> lock(mu);
-        order.push_back(name);
-        last = order.size() == 3;
-      }
-      if (last) done.signal();  // after unlocking: the test may end at once
-    };
-  };
-  low->async(record("low"));
-  mid->async(record("mid"));
-  high->async(record("high"));
-  release = true;
-  ASSERT_EQ(done.waitFor(5s), WaitResult::Succeeded);
-  EXPECT_THAT(order, ::testing::ElementsAre("high", "mid", "low"));
 }
 
 TEST(DispatchSerialQueue, SyncRunsInlineWhenIdleAndHopsBehindPendingWorkKeepingTheChainCurrent) {
@@ -191,6 +125,42 @@ TEST(DispatchSerialQueueDeathTest, SyncOntoTheCurrentChainAndWrongQueueAssertsAb
   EXPECT_DEATH(actual->sync([&] { QV_ASSERT_ON_QUEUE(expected); }),
                "expected to run on queue 'test.expected' but running on 'test.actual'");
   EXPECT_DEATH(expected->assertCurrent(), "'test.expected' but running on no queue");
+}
+
+TEST(DispatchGroup, WaitAndNotifyComeAfterEveryTask) {
+  auto group = Group::create();
+  auto notifyQueue = SerialQueue::create("test.notify");
+  constexpr int kTasks = 50;
+  std::atomic<int> finished{0};
+  std::atomic<int> finishedAtNotify{-1};
+  std::atomic<bool> notifyOnQueue{false};
+  Semaphore notified;
+  Semaphore gate;
+  for (int i = 0; i < kTasks; ++i) {
+    group->async(ConcurrentQueue::shared(), [&, i] {
+      if (i == 0) gate.wait();  // holds the group open until we say so
+      finished.fetch_add(1);
+    });
+  }
+  group->notify(notifyQueue, [&] {
+    finishedAtNotify = finished.load();
+    notifyOnQueue = notifyQueue->isCurrent();
+    notified.signal();
+  });
+  EXPECT_EQ(group->waitFor(30ms), WaitResult::TimedOut);
+  EXPECT_EQ(notified.waitFor(0ms), WaitResult::TimedOut);
+  gate.signal();
+  group->wait();
+  EXPECT_EQ(finished.load(), kTasks);
+  ASSERT_EQ(notified.waitFor(5s), WaitResult::Succeeded);
+  EXPECT_EQ(finishedAtNotify.load(), kTasks);
+  EXPECT_TRUE(notifyOnQueue);
+}
+
+TEST(DispatchGroupDeathTest, LeaveWithoutEnterAborts) {
+  GTEST_FLAG_SET(death_test_style, "threadsafe");
+  auto group = Group::create();
+  EXPECT_DEATH(group->leave(), "leave\\(\\) without a matching enter\\(\\)");
 }
 
 }  // namespace

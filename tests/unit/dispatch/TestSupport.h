@@ -2,7 +2,6 @@
 #pragma once
 
 #include <chrono>
-#include <fstream>
 #include <functional>
 #include <string>
 #include <thread>
@@ -32,19 +31,8 @@ inline std::string numbered(const char* prefix, int n) {
   return s;
 }
 
-// The "Threads:" line of /proc/self/status.
-inline int processThreadCount() {
-  std::ifstream status("/proc/self/status");
-  std::string line;
-  while (std::getline(status, line)) {
-    if (line.rfind("Threads:", 0) == 0) return std::stoi(line.substr(8));
-  }
-  return -1;
-}
-
-// Cancels `source` and returns once its cancel handler has run, that is once
-// no handler of it runs any more; `then` (closing the fd, say) runs in the
-// cancel handler. Answers whether that happened in time.
+// Cancels `source` and returns once its cancel handler (which runs `then`)
+// has run, that is once no handler of it runs any more.
 inline bool cancelAndWait(const std::shared_ptr<FdSource>& source,
                           std::function<void()> then = nullptr) {
   auto done = std::make_shared<Semaphore>();

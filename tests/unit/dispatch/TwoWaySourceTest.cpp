@@ -7,7 +7,6 @@
 #include <gtest/gtest.h>
 
 #include <atomic>
-#include <cerrno>
 #include <memory>
 #include <mutex>
 #include <string>
@@ -37,8 +36,7 @@ struct SocketPair {
     if (near >= 0) close(near);
     if (far >= 0) close(far);
   }
-  // Cancels the source watching `near` and closes `near` in its cancel
-  // handler, where the contract allows it.
+  // Cancels the source watching `near`; closes `near` in its cancel handler.
   void finish(const std::shared_ptr<FdSource>& source) {
     int fd = near;
     near = -1;
@@ -47,18 +45,10 @@ struct SocketPair {
   void send(int fd, const std::string& bytes) const {
     ASSERT_EQ(::send(fd, bytes.data(), bytes.size(), MSG_NOSIGNAL), ssize_t(bytes.size()));
   }
-  // Reads what is there; answers whether it reached EAGAIN (not EOF).
-  static bool readAll(int fd, std::string* into, bool* eof = nullptr) {
+  // Reads what is there, until EAGAIN or EOF.
+  static void readAll(int fd, std::string* into) {
     char buf[4096];
-    for (;;) {
-      ssize_t n = ::recv(fd, buf, sizeof buf, MSG_DONTWAIT);
-      if (n > 0) {
-        into->append(buf, size_t(n));
-        continue;
-      }
-      if (n == 0 && eof != nullptr) *eof = true;
-      return n < 0 && errno == EAGAIN;
-    }
+    for (ssize_t n; (n = ::recv(fd, buf, sizeof buf, MSG_DONTWAIT)) > 0;) into->append(buf, size_t(n));
   }
   // Fills `fd`'s send buffer until the kernel refuses more.
   static void fill(int fd) {
@@ -116,17 +106,15 @@ TEST(DispatchTwoWaySource, EachDirectionHasItsHandlerAndItsOwnSuspension) {
       });
   ASSERT_TRUE(source);
 
-  // Reads only: the socket is writable all along, yet no write handler.
+  // Reads only at first; then a full socket is not writable: no write
+  // handler until the far side reads.
   source->resume(FdSource::Event::Readable);
   pair.send(pair.far, "ping");
   ASSERT_EQ(readDone.waitFor(5s), WaitResult::Succeeded);
-  std::this_thread::sleep_for(50ms);
-  EXPECT_EQ(writes.load(), 0);
-
-  // A full socket is not writable: nothing until the far side reads.
   SocketPair::fill(pair.near);
   source->resume(FdSource::Event::Writable);
   EXPECT_EQ(writeDone.waitFor(100ms), WaitResult::TimedOut);
+  EXPECT_EQ(writes.load(), 0);
   std::string sink;
   SocketPair::readAll(pair.far, &sink);
   ASSERT_EQ(writeDone.waitFor(5s), WaitResult::Succeeded);
@@ -141,8 +129,7 @@ TEST(DispatchTwoWaySource, EachDirectionHasItsHandlerAndItsOwnSuspension) {
   }
   EXPECT_FALSE(overlapped);
   {
-    // Not held across cancel(): a late read handler may still want it.
-    std::lock_guard<std::mutex> lock(receivedMu);
+    std::lock_guard<std::mutex> lock(receivedMu);  // not held across cancel()
     EXPECT_EQ(received, "ping" + std::string(20, 'x'));
   }
   int fd = pair.near;

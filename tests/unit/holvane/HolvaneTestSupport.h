@@ -23,11 +23,9 @@
 
 namespace platform::holvane::testing {
 
-// The platform root is process-wide and read by other layers at any time,
-// so it is set once; each test then works in a fresh directory below it and
-// hands that to the registry explicitly.
+// The platform root is process-wide, so it is set once; each test works in
+// a fresh directory below it. Removed when the process ends.
 inline const std::string& processRoot() {
-  // Removed when the process ends, so that a run leaves nothing behind.
   struct Directory {
     std::string path;
     bool made = false;  // never remove a directory this process did not make
@@ -90,13 +88,11 @@ inline Dictionary plugInInfo(const std::string& bundleId, const std::string& poi
                     {"XOExtension", extension}};
 }
 
-// Writes an application bundle with an executable (unless `placeholder`).
-enum class AppExecutable { Present, Missing };
-inline void writeApplication(const std::string& appPath, const std::string& bundleId,
-                             AppExecutable executable = AppExecutable::Present) {
+// Writes an application bundle with an executable.
+inline void writeApplication(const std::string& appPath, const std::string& bundleId) {
   writeVmap(appPath + "/Info.vmap",
             Dictionary{{"BXBundleIdentifier", bundleId}, {"BXExecutable", "App"}});
-  if (executable == AppExecutable::Present) writeText(appPath + "/App", "#!/bin/sh\n");
+  writeText(appPath + "/App", "#!/bin/sh\n");
 }
 
 struct RegistryUnderTest {

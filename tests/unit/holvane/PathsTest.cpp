@@ -20,16 +20,13 @@ TEST(PathsTest, CanonicalBundlePaths) {
   };
   const Case cases[] = {
       {root / "real/B.ovx", root / "real/B.ovx"},
-      {root / "real/B.ovx//", root / "real/B.ovx"},
       {root / "link/B.ovx", root / "real/B.ovx"},
       {root / "link/./B.ovx/", root / "real/B.ovx"},
       // Gone: the parent is resolved, the name kept, so a deleted bundle
       // can still be unregistered by the path it was registered under.
       {root / "link/Gone.ovx", root / "real/Gone.ovx"},
-      {root / "link/..", root.path()},
       {root / "nowhere/Gone.ovx", std::nullopt},
       {"relative/B.ovx", std::nullopt},
-      {"", std::nullopt},
   };
   for (const Case& c : cases) {
     EXPECT_EQ(canonicalBundlePath(c.given), c.expected) << c.given;

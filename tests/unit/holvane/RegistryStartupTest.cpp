@@ -123,36 +123,5 @@ TEST_F(RegistryStartupTest, DamagedDatabaseIsMovedAsideAndRebuilt) {
   EXPECT_TRUE(opened.registry->registerPlugIn(app_ + "/PlugIns/Share.ovx").ok());
 }
 
-TEST_F(RegistryStartupTest, ScanLimits) {
-  auto sdks = std::make_shared<LinuxSdkRegistry>(root_ / "System/Library/ExtensionPoints");
-  auto entitlements = std::make_shared<codesign::LinuxEntitlementStore>(
-      root_ / "etc/quorvex/entitlements", ::geteuid());
-  const std::string worldClock = root_ / "System/Library/PlugIns/WorldClock.ovx";
-  struct Case {
-    const char* name;
-    ScanLimits limits;
-    std::vector<std::string> stored;
-    const char* logged;
-  };
-  // Candidates in order: WorldClock, then Host.app's Broken, Share, Today.
-  const Case cases[] = {
-      {"a directory over the limit is skipped whole", ScanLimits{.maxEntriesPerDirectory = 2},
-       {worldClock}, "more than 2 entries"},
-      {"only the first bundles of an oversized system are registered",
-       ScanLimits{.maxCandidates = 3}, {app_ + "/PlugIns/Share.ovx", worldClock},
-       "more than 3 plug-in bundles"},
-  };
-  for (const Case& c : cases) {
-    SCOPED_TRACE(c.name);
-    std::filesystem::remove_all(root_ / "var/db/holvane");
-    log::LogCaptureForTesting capture;
-    Result<std::shared_ptr<LinuxRegistry>> opened =
-        LinuxRegistry::open(root_.locations(), sdks, entitlements, StartupScan::Run, c.limits);
-    ASSERT_TRUE(opened.ok());
-    EXPECT_EQ(storedPaths(**opened), c.stored);
-    EXPECT_TRUE(anyLine(capture.messages(), c.logged));
-  }
-}
-
 }  // namespace
 }  // namespace platform::holvane

@@ -1,6 +1,5 @@
 // Helpers shared by the log tests: a temporary file to send lines to, an
-// argument that counts its descriptions, and a fixture that puts the log
-// layer back in its default state around a test.
+// argument that counts its descriptions, and a fixture that resets the log layer.
 #pragma once
 
 #include <gtest/gtest.h>
@@ -19,29 +18,21 @@
 
 namespace platform::log::testing {
 
-// An anonymous file that log lines can be written to and read back from.
 class TempFile {
  public:
-  TempFile() : file_(std::tmpfile()) {}
   ~TempFile() { std::fclose(file_); }
-  TempFile(const TempFile&) = delete;
-  TempFile& operator=(const TempFile&) = delete;
-
   int fd() const { return fileno(file_); }
-
   // "device:inode", as journald puts it in JOURNAL_STREAM.
   std::string journalStreamValue() const {
     struct stat st {};
     fstat(fd(), &st);
     return std::to_string(st.st_dev) + ":" + std::to_string(st.st_ino);
   }
-
   std::vector<std::string> lines() const {
     std::string all;
     char buffer[4096];
-    for (ssize_t n; (n = pread(fd(), buffer, sizeof buffer, static_cast<off_t>(all.size()))) > 0;) {
+    for (ssize_t n; (n = pread(fd(), buffer, sizeof buffer, static_cast<off_t>(all.size()))) > 0;)
       all.append(buffer, static_cast<std::size_t>(n));
-    }
     std::vector<std::string> out;
     std::istringstream in(all);
     for (std::string line; std::getline(in, line);) out.push_back(line);
@@ -49,19 +40,15 @@ class TempFile {
   }
 
  private:
-  std::FILE* file_;
+  std::FILE* file_ = std::tmpfile();
 };
 
 // Counts how often it is described, to prove when formatting happens.
 struct Counted {
   mutable std::atomic<int> calls{0};
-  std::string description() const {
-    ++calls;
-    return "counted";
-  }
+  std::string description() const { return ++calls, "counted"; }
 };
 
-// Resets filter, environment and output around each test.
 class LogTest : public ::testing::Test {
  protected:
   void SetUp() override { reset(); }
@@ -69,14 +56,10 @@ class LogTest : public ::testing::Test {
     internal::Output::shared().setDescriptorForTesting(STDERR_FILENO);
     reset();
   }
-
   static void reset() {
-    unsetenv("QV_LOG");
-    unsetenv("QV_LOG_PRIVATE");
-    unsetenv("JOURNAL_STREAM");
+    for (const char* name : {"QV_LOG", "QV_LOG_PRIVATE", "JOURNAL_STREAM"}) unsetenv(name);
     LoggerRegistry::shared().reloadEnvironmentForTesting();
   }
-
   static const Logger& logger(std::string_view subsystem, std::string_view category) {
     return *LoggerRegistry::shared().logger(subsystem, category).value();
   }

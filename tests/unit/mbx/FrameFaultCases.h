@@ -26,13 +26,6 @@ inline Bytes withBody(const Bytes& body, std::uint16_t flags, std::uint64_t id,
   return rawFrame(header(flags, id, static_cast<std::uint32_t>(body.size()), inReplyTo), body);
 }
 
-// `depth` arrays of one element around an integer.
-inline Bytes nestedArrays(int depth) {
-  Bytes bytes(static_cast<std::size_t>(depth), 0x81);
-  bytes.push_back(0x01);
-  return bytes;
-}
-
 struct FaultCase {
   const char* name;
   Bytes bytes;
@@ -43,43 +36,26 @@ struct FaultCase {
 inline std::vector<FaultCase> frameFaultCases() {
   const Bytes map = cborOf(Dictionary{{"k", 1}});
   const Bytes first = frameBytes(FrameKind::Message, 5, Dictionary{{"seq", 0}});
-  auto version = [&](std::uint16_t v) {
-    FrameHeader h = header(0, 1, static_cast<std::uint32_t>(map.size()));
-    h.version = v;
-    return rawFrame(h, map);
-  };
+  FrameHeader v2 = header(0, 1, static_cast<std::uint32_t>(map.size()));
+  v2.version = 2;
   return {
-      {"bad magic", concat({{'Q', 'V', 'M', 'b'}, Bytes(24, 0)}), FrameFault::BadMagic},
       {"another protocol, seen at four bytes", {'G', 'E', 'T', ' '}, FrameFault::BadMagic},
-      {"version 2", version(2), FrameFault::UnknownVersion},
-      {"version 0", version(0), FrameFault::UnknownVersion},
-      {"unknown flag 0x8", withBody(map, 0x8, 1), FrameFault::UnknownFlags},
+      {"version 2", rawFrame(v2, map), FrameFault::UnknownVersion},
       {"unknown flag 0x8000", withBody(map, 0x8000, 1), FrameFault::UnknownFlags},
-      {"reply expected and reply", withBody(map, 0x3, 1, 1), FrameFault::ConflictingFlags},
       {"goodbye expecting a reply", withBody({}, 0x5, 1), FrameFault::ConflictingFlags},
       {"zero message id", withBody(map, 0, 0), FrameFault::ZeroMessageId},
       {"repeated message id", concat({first, first}), FrameFault::NonIncreasingMessageId},
-      {"decreasing message id", concat({first, withBody(map, 0, 4)}),
-       FrameFault::NonIncreasingMessageId},
       {"body length over 16 MiB", rawFrame(header(0, 1, kMaxBodyBytes + 1), {}),
        FrameFault::BodyTooLarge},
       {"goodbye with a body", withBody(map, kFlagGoodbye, 1), FrameFault::GoodbyeWithBody},
       {"reply to request 0", withBody(map, kFlagReply, 1), FrameFault::ReplyWithoutRequestId},
-      {"in-reply-to on a request", withBody(map, kFlagReplyExpected, 1, 9),
-       FrameFault::RequestIdWithoutReply},
       {"in-reply-to on a message", withBody(map, 0, 1, 9), FrameFault::RequestIdWithoutReply},
       {"truncated body at EOF", rawFrame(header(0, 1, 100), Bytes(10, 0x61)),
        FrameFault::TruncatedAtEof, true},
       {"empty body", withBody({}, 0, 1), FrameFault::UndecodableBody},
       {"trailing bytes", withBody(concat({map, {0x00}}), 0, 1), FrameFault::UndecodableBody},
-      {"nesting over 64", withBody(nestedArrays(65), 0, 1), FrameFault::UndecodableBody},
-      {"invalid UTF-8", withBody({0x62, 0xed, 0xa0}, 0, 1), FrameFault::UndecodableBody},
-      {"duplicate keys", withBody({0xa2, 0x61, 'a', 0x01, 0x61, 'a', 0x01}, 0, 1),
+      {"nesting over 64", withBody(concat({Bytes(65, 0x81), {0x01}}), 0, 1),
        FrameFault::UndecodableBody},
-      {"non-text key", withBody({0xa1, 0x41, 'a', 0x01}, 0, 1), FrameFault::UndecodableBody},
-      {"indefinite-length map", withBody({0xbf, 0x61, 'k', 0x01, 0xff}, 0, 1),
-       FrameFault::UndecodableBody},
-      {"null value", withBody({0xf6}, 0, 1), FrameFault::UndecodableBody},
   };
 }
 

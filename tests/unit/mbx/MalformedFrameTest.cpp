@@ -4,15 +4,11 @@
 // peer that never reads is cut off at the output limit.
 #include <gtest/gtest.h>
 
-#include <chrono>
-
 #include "platform/log/LogCaptureForTesting.h"
 #include "platform/mbx/FrameReader.h"
-#include "platform/mbx/MbxError.h"
 #include "platform/mbx/Reply.h"
 #include "tests/unit/mbx/FrameFaultCases.h"
 #include "tests/unit/mbx/MbxTestServer.h"
-#include "tests/unit/mbx/MbxTestSupport.h"
 
 namespace platform::mbx {
 namespace {
@@ -22,11 +18,17 @@ using namespace testing;
 bool loggedContaining(const log::LogCaptureForTesting& capture, const std::string& text) {
   for (const auto& line : capture.lines()) {
     if (line.category == "mbx" && line.level >= log::Level::Error &&
-        line.message.find(text) != std::string::npos) {
+        line.message.find(text) != std::string::npos)
       return true;
-    }
   }
   return false;
+}
+
+std::shared_ptr<Connection> client(const std::string& service) {
+  auto connection = Connection::connectToService(service).value();
+  connection->setEventHandler([](const ConnectionEvent&) {});
+  connection->resume();
+  return connection;
 }
 
 class MbxMalformed : public ::testing::Test {
@@ -38,12 +40,8 @@ TEST_F(MbxMalformed, EachBrokenRuleEndsOnlyItsConnection) {
   TestServer server("strict");
   ASSERT_TRUE(server.listening());
   // A client that stays connected throughout and must keep being answered.
-  auto witness = Connection::connectToService("strict");
-  ASSERT_TRUE(witness.ok());
-  witness.value()->setEventHandler([](const ConnectionEvent&) {});
-  witness.value()->resume();
-  ASSERT_TRUE(witness.value()->sendWithReplySync(Dictionary{}).ok());
-
+  auto witness = client("strict");
+  ASSERT_TRUE(witness->sendWithReplySync(Dictionary{}).ok());
   std::size_t index = 1;
   for (const FaultCase& c : frameFaultCases()) {
     SCOPED_TRACE(c.name);
@@ -57,14 +55,11 @@ TEST_F(MbxMalformed, EachBrokenRuleEndsOnlyItsConnection) {
     std::vector<std::string> expected;
     FrameReader reader;
     std::span<const std::uint8_t> input(c.bytes);
-    for (auto step = reader.next(input); step.ok() && step.value(); step = reader.next(input)) {
+    for (auto step = reader.next(input); step.ok() && step.value(); step = reader.next(input))
       expected.push_back("seq " + step.value()->body.dictionary()->get("seq").description());
-    }
     expected.insert(expected.end(), {"invalid", "finalized"});
-    EXPECT_EQ(server.events(index), expected);
-    auto alive = witness.value()->sendWithReplySync(Dictionary{{"after", c.name}});
-    EXPECT_TRUE(alive.ok());
-    ++index;
+    EXPECT_EQ(server.events(index++), expected);
+    EXPECT_TRUE(witness->sendWithReplySync(Dictionary{{"after", c.name}}).ok());
   }
 }
 
@@ -76,15 +71,10 @@ TEST_F(MbxMalformed, AStalledHalfFrameDelaysNobody) {
   RawPeer stalledInBody(root_.socketPath("stall"), Bytes(frame.begin(), frame.begin() + 500),
                         RawAfter::HoldUntilReleased);
   ASSERT_TRUE(eventually([&] { return server.connectionCount() == 2; }));
-
-  auto client = Connection::connectToService("stall");
-  ASSERT_TRUE(client.ok());
-  client.value()->setEventHandler([](const ConnectionEvent&) {});
-  client.value()->resume();
+  auto connection = client("stall");
   const auto start = std::chrono::steady_clock::now();
-  for (int i = 0; i < 200; ++i) {
-    ASSERT_TRUE(client.value()->sendWithReplySync(Dictionary{{"i", i}}).ok());
-  }
+  for (int i = 0; i < 200; ++i)
+    ASSERT_TRUE(connection->sendWithReplySync(Dictionary{{"i", i}}).ok());
   EXPECT_LT(std::chrono::steady_clock::now() - start, 3s);
   // The stalled peers are still connected, with nothing delivered.
   EXPECT_TRUE(server.events(0).empty());
@@ -98,20 +88,17 @@ TEST_F(MbxMalformed, AStalledHalfFrameDelaysNobody) {
 TEST_F(MbxMalformed, APeerThatNeverReadsIsCutOffAtTheOutputLimit) {
   ConnectionLimits limits;
   limits.maxQueuedOutputBytes = 512u << 10;
-  constexpr std::size_t kReplyBytes = 64u << 10;
   std::atomic<std::size_t> mostQueued{0};
   TestServer server("deaf", limits, [&](const std::shared_ptr<Connection>& c, const Message& m) {
     Reply reply = Reply::createReply(m);
-    reply.body().set("blob", Data(kReplyBytes, 1));
+    reply.body().set("blob", Data(64u << 10, 1));
     reply.send();
     mostQueued = std::max(mostQueued.load(), c->queuedOutputBytesForTesting());
   });
   log::LogCaptureForTesting capture;
   Bytes requests;
-  for (std::uint64_t id = 1; id <= 400; ++id) {
-    Bytes frame = frameBytes(FrameKind::Request, id, Dictionary{{"id", id}});
-    requests.insert(requests.end(), frame.begin(), frame.end());
-  }
+  for (std::uint64_t id = 1; id <= 400; ++id)
+    requests = concat({requests, frameBytes(FrameKind::Request, id, Dictionary{{"id", id}})});
   RawPeer deaf(root_.socketPath("deaf"), requests, RawAfter::HoldUntilReleased);
   ASSERT_TRUE(server.waitFor(0, "invalid"));
   EXPECT_TRUE(loggedContaining(capture, "does not read"));

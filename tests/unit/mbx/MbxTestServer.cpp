@@ -1,21 +1,20 @@
 #include "tests/unit/mbx/MbxTestServer.h"
 
+#include <atomic>
+
 #include "platform/mbx/Reply.h"
 
 namespace platform::mbx::testing {
 
 TestServer::TestServer(const std::string& service, ConnectionLimits limits,
                        RequestHandler onRequest)
-    : service_(service),
-      onRequest_(std::move(onRequest)),
-      queue_(dispatch::SerialQueue::create("test.server")) {
+    : onRequest_(std::move(onRequest)) {
   auto listener = Listener::create(service, queue_, limits);
   if (!listener.ok()) return;
   listener_ = listener.value();
   listener_->setEventHandler([this](const Listener::Event& event) {
-    if (const auto* connection = std::get_if<std::shared_ptr<Connection>>(&event)) {
+    if (const auto* connection = std::get_if<std::shared_ptr<Connection>>(&event))
       adopt(*connection);
-    }
   });
   listener_->resume();
 }
@@ -24,80 +23,66 @@ TestServer::~TestServer() {
   if (listener_) listener_->cancel();
   std::vector<Entry> entries;
   {
-    std::lock_guard<std::mutex> lock(mu_);
+    std::lock_guard lock(mu_);
     entries = entries_;
   }
-  for (Entry& entry : entries) entry.connection->cancel();
+  for (Entry& entry : entries) entry.first->cancel();
   // Handlers refer to this object: wait until every connection has finished.
-  for (Entry& entry : entries) {
-    eventually([&] { return entry.recorder->count("finalized") > 0; });
-  }
+  for (Entry& entry : entries) eventually([&] { return entry.second->count("finalized") > 0; });
   if (listener_) queue_->sync([] {});
 }
 
 void TestServer::adopt(const std::shared_ptr<Connection>& connection) {
-  Entry entry{connection, std::make_shared<Recorder>(), std::make_shared<std::atomic<int>>(0)};
+  auto recorder = std::make_shared<Recorder>();
   std::weak_ptr<Connection> weak = connection;
-  connection->setEventHandler([this, weak, recorder = entry.recorder,
-                               busy = entry.busy](const ConnectionEvent& event) {
+  connection->setEventHandler([this, weak, recorder, busy = std::make_shared<std::atomic<int>>(0)](
+                                  const ConnectionEvent& event) {
     auto self = weak.lock();
     if (busy->fetch_add(1) != 0) recorder->add("overlap");
     if (self && !self->deliveryQueue()->isCurrent()) recorder->add("off-queue");
-    if (const auto* error = std::get_if<ConnectionError>(&event)) {
-      recorder->add(*error == ConnectionError::Invalid ? "invalid" : "goodbye");
-    } else {
-      const Message& message = std::get<Message>(event);
-      if (message.expectsReply()) {
-        recorder->add("request");
-        if (onRequest_) {
-          onRequest_(self, message);
-        } else {
-          Reply reply = Reply::createReply(message);
-          reply.body().set("echo", message.body());
-          reply.send();
-        }
-      } else if (const Dictionary* body = message.dictionary()) {
-        const Value* seq = body->find("seq");
-        recorder->add(seq != nullptr ? "seq " + seq->description() : "map");
+    const Message* message = std::get_if<Message>(&event);
+    if (message == nullptr) {
+      recorder->add(std::get<ConnectionError>(event) == ConnectionError::Invalid ? "invalid"
+                                                                                 : "goodbye");
+    } else if (message->expectsReply()) {
+      recorder->add("request");
+      if (onRequest_) {
+        onRequest_(self, *message);
       } else {
-        recorder->add("non-map " + message.body().description());
+        Reply reply = Reply::createReply(*message);
+        reply.body().set("echo", message->body());
+        reply.send();
       }
+    } else if (const Dictionary* body = message->dictionary()) {
+      const Value* seq = body->find("seq");
+      recorder->add(seq != nullptr ? "seq " + seq->description() : "map");
+    } else {
+      recorder->add("non-map " + message->body().description());
     }
     busy->fetch_sub(1);
   });
-  connection->setContext(entry.recorder, [](std::shared_ptr<void> context) {
+  connection->setContext(recorder, [](std::shared_ptr<void> context) {
     static_cast<Recorder*>(context.get())->add("finalized");
   });
   {
-    std::lock_guard<std::mutex> lock(mu_);
-    entries_.push_back(entry);
+    std::lock_guard lock(mu_);
+    entries_.emplace_back(connection, recorder);
   }
   connection->resume();
 }
 
 std::size_t TestServer::connectionCount() const {
-  std::lock_guard<std::mutex> lock(mu_);
+  std::lock_guard lock(mu_);
   return entries_.size();
 }
 
-std::shared_ptr<Connection> TestServer::connection(std::size_t i) const {
-  std::lock_guard<std::mutex> lock(mu_);
-  return entries_.at(i).connection;
+TestServer::Entry TestServer::entry(std::size_t i) const {
+  std::lock_guard lock(mu_);
+  return entries_.at(i);
 }
 
-std::vector<std::string> TestServer::events(std::size_t i) const {
-  std::lock_guard<std::mutex> lock(mu_);
-  return entries_.at(i).recorder->entries();
-}
-
-bool TestServer::waitFor(std::size_t i, const std::string& entry,
-                         std::chrono::milliseconds limit) const {
-  return eventually(
-      [&] {
-        std::lock_guard<std::mutex> lock(mu_);
-        return i < entries_.size() && entries_[i].recorder->count(entry) > 0;
-      },
-      limit);
+bool TestServer::waitFor(std::size_t i, const std::string& event) const {
+  return eventually([&] { return i < connectionCount() && entry(i).second->count(event) > 0; });
 }
 
 bool roundTrip(const std::string& service) {

@@ -1,22 +1,13 @@
 // A listener in the test process that records, per connection, what the
-// connection delivered, in order, as short text:
-//   "seq N"       a message {"seq": N}
-//   "map"         another message whose body is a map
-//   "non-map V"   a message whose body is not a map (V its description)
-//   "request"     a request (answered {"echo": body} unless onRequest is set)
-//   "goodbye"     TerminationImminent
-//   "invalid"     Invalid
-//   "finalized"   the context finalizer ran
-// It also records "off-queue" or "overlap" should an event ever arrive off
-// the connection's delivery queue or while another is being handled.
+// connection delivered, in order: "seq N" for a message {"seq": N}, "map"
+// for another map, "non-map V" for another body, "request" (answered
+// {"echo": body} unless onRequest is set), "goodbye", "invalid" and
+// "finalized" (the context finalizer ran). It also records "off-queue" or
+// "overlap" should an event arrive off the delivery queue or while another
+// is being handled.
 #pragma once
 
-#include <atomic>
 #include <functional>
-#include <memory>
-#include <mutex>
-#include <string>
-#include <vector>
 
 #include "platform/dispatch/SerialQueue.h"
 #include "platform/mbx/Connection.h"
@@ -35,33 +26,25 @@ class TestServer {
   ~TestServer();
 
   bool listening() const { return listener_ != nullptr; }
-  const std::string& service() const { return service_; }
-
   std::size_t connectionCount() const;
-  // REQUIRES: i < connectionCount().
-  std::shared_ptr<Connection> connection(std::size_t i) const;
-  std::vector<std::string> events(std::size_t i) const;
-  // Waits until connection i exists and has recorded `entry`.
-  bool waitFor(std::size_t i, const std::string& entry, std::chrono::milliseconds limit = 10s) const;
+  std::shared_ptr<Connection> connection(std::size_t i) const { return entry(i).first; }
+  std::vector<std::string> events(std::size_t i) const { return entry(i).second->entries(); }
+  // Waits until connection i exists and has recorded `event`.
+  bool waitFor(std::size_t i, const std::string& event) const;
 
  private:
-  struct Entry {
-    std::shared_ptr<Connection> connection;
-    std::shared_ptr<Recorder> recorder;
-    std::shared_ptr<std::atomic<int>> busy;
-  };
+  using Entry = std::pair<std::shared_ptr<Connection>, std::shared_ptr<Recorder>>;
+  Entry entry(std::size_t i) const;
   void adopt(const std::shared_ptr<Connection>& connection);
 
-  const std::string service_;
   const RequestHandler onRequest_;
-  std::shared_ptr<dispatch::SerialQueue> queue_;
+  std::shared_ptr<dispatch::SerialQueue> queue_ = dispatch::SerialQueue::create("test.server");
   std::shared_ptr<Listener> listener_;
   mutable std::mutex mu_;
   std::vector<Entry> entries_;
 };
 
-// A request from a new connection in this process: answers whether `service`
-// replied.
+// A request from a new connection in this process: whether `service` replied.
 bool roundTrip(const std::string& service);
 
 }  // namespace platform::mbx::testing

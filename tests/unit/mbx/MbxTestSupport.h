@@ -5,6 +5,7 @@
 
 #include <sys/types.h>
 
+#include <algorithm>
 #include <chrono>
 #include <cstdint>
 #include <functional>
@@ -31,50 +32,40 @@ class TemporaryRoot {
   TemporaryRoot();
   ~TemporaryRoot();
   TemporaryRoot(const TemporaryRoot&) = delete;
-  TemporaryRoot& operator=(const TemporaryRoot&) = delete;
 
   const std::string& path() const { return path_; }
-  // Where the socket of `service` lives.
-  std::string socketPath(const std::string& service) const;
+  std::string socketPath(const std::string& service) const {
+    return path_ + "/run/quorvex/mbx/" + service;
+  }
 
  private:
   std::string path_;
 };
 
 // A valid frame with message id `id`.
-Bytes frameBytes(FrameKind kind, std::uint64_t id, const Value& body,
-                 std::uint64_t inReplyTo = 0);
-// A frame with any header at all and `body` (bodyLength taken from the
-// header as given, not from `body`).
+Bytes frameBytes(FrameKind kind, std::uint64_t id, const Value& body, std::uint64_t inReplyTo = 0);
+// A frame with any header at all (bodyLength as given, not from `body`).
 Bytes rawFrame(const FrameHeader& header, const Bytes& body);
-// The CBOR encoding of a value.
 Bytes cborOf(const Value& value);
 Bytes concat(std::initializer_list<Bytes> parts);
 
-// What a raw peer does after writing its bytes.
-enum class RawAfter {
-  AwaitEof,              // read (and discard) until the server ends the connection
-  ShutdownThenAwaitEof,  // end its own side first, then as AwaitEof
-  HoldUntilReleased,     // neither read nor close until release()
-};
-
 // A forked child that connects to a socket path, writes prepared bytes and
-// then does what `after` says. The child makes only system calls (everything
-// is prepared before the fork), so the test's threads do not matter.
+// then does what `after` says: read until the server ends the connection
+// (after ending its own side first, with ShutdownThenAwaitEof), or neither
+// read nor close until release(). It makes only system calls, so the test's
+// threads do not matter.
+enum class RawAfter { AwaitEof, ShutdownThenAwaitEof, HoldUntilReleased };
 class RawPeer {
  public:
   RawPeer(const std::string& socketPath, Bytes bytes, RawAfter after);
-  ~RawPeer();
-  RawPeer(const RawPeer&) = delete;
-  RawPeer& operator=(const RawPeer&) = delete;
-
-  // Lets a HoldUntilReleased child close its connection and exit.
-  void release();
-  // Waits for the child: 0 when its connection was ended by the server (or
-  // it was released), 1 when it could not connect, 2 when it waited for the
-  // end in vain (10 s).
+  ~RawPeer() {
+    release();
+    wait();
+  }
+  void release();  // lets a HoldUntilReleased child close and exit
+  // 0 when the server ended its connection (or it was released), 1 when it
+  // could not connect, 2 when it waited for the end in vain (10 s).
   int wait();
-
   static constexpr int kEndedByServer = 0;
 
  private:
@@ -84,36 +75,38 @@ class RawPeer {
 };
 
 // The helper program (MbxTestPeer.cpp), started with posix_spawn so that it
-// begins as a fresh process. Its stdin stays open while the object lives.
+// begins as a fresh process. Its stdin stays open until wait().
 class PeerProcess {
  public:
   explicit PeerProcess(const std::vector<std::string>& arguments);
-  ~PeerProcess();
-  PeerProcess(const PeerProcess&) = delete;
-  PeerProcess& operator=(const PeerProcess&) = delete;
+  ~PeerProcess() { wait(); }
 
   pid_t pid() const { return pid_; }
-  // Waits for a line on its stdout.
-  bool waitForLine(const std::string& line, std::chrono::milliseconds limit = 10s);
-  void closeStdin();
-  // The exit status, or -1 when it had to be killed after `limit`.
-  int wait(std::chrono::milliseconds limit = 10s);
+  // The exit status, or -1 when it had to be killed after 10 s.
+  int wait();
 
  private:
   pid_t pid_ = -1;
   int stdinFd_ = -1;
-  int stdoutFd_ = -1;
-  std::string pendingOutput_;
   int status_ = -2;
 };
 
 // A thread-safe list of what a handler saw, for checks from the test thread.
 class Recorder {
  public:
-  void add(std::string entry);
-  std::vector<std::string> entries() const;
-  std::size_t size() const;
-  std::size_t count(const std::string& entry) const;
+  void add(std::string entry) {
+    std::lock_guard lock(mu_);
+    entries_.push_back(std::move(entry));
+  }
+  std::vector<std::string> entries() const {
+    std::lock_guard lock(mu_);
+    return entries_;
+  }
+  std::size_t size() const { return entries().size(); }
+  std::size_t count(const std::string& entry) const {
+    auto all = entries();
+    return static_cast<std::size_t>(std::count(all.begin(), all.end(), entry));
+  }
 
  private:
   mutable std::mutex mu_;

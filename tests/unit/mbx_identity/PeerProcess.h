@@ -1,8 +1,6 @@
 // A real client process for the identity tests: the identity peer program (or
 // a copy of it) started against a listening socket of the test's own, its
-// connection accepted, and its first answer read.
-//
-// Thread safety: use from one thread.
+// connection accepted, and its first answer read. Use from one thread.
 #pragma once
 
 #include <gtest/gtest.h>
@@ -15,12 +13,9 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
-#include <cerrno>
 #include <cstring>
 #include <filesystem>
 #include <memory>
-#include <string>
-#include <vector>
 
 #include "platform/mbx/identity/internal/UniqueFd.h"
 
@@ -28,55 +23,40 @@ extern char** environ;
 
 namespace platform::mbx::testing {
 
-// The programs built beside the tests.
 inline constexpr const char* kPeerProgram = IDENTITY_PEER_PATH;
 inline constexpr const char* kExecTargetProgram = EXEC_TARGET_PATH;
 
 // A fresh directory under /tmp, removed with everything in it.
-class TempDir {
- public:
-  TempDir() {
-    char pattern[] = "/tmp/qv-identity-XXXXXX";
-    EXPECT_NE(::mkdtemp(pattern), nullptr) << std::strerror(errno);
-    path_ = pattern;
-  }
+struct TempDir {
+  TempDir() : path(::mkdtemp(std::string("/tmp/qv-identity-XXXXXX").data())) {}
   ~TempDir() {
     std::error_code ignored;
-    std::filesystem::remove_all(path_, ignored);
+    std::filesystem::remove_all(path, ignored);
   }
-  const std::string& path() const { return path_; }
-
- private:
-  std::string path_;
+  std::string path;
 };
 
 class PeerProcess {
  public:
-  // Runs `program` with `mode` (see IdentityPeerMain.cpp) and `name`. Reports
-  // a test failure and returns null when it does not connect and answer.
-  static std::unique_ptr<PeerProcess> start(const std::string& program, const std::string& mode,
-                                            const std::string& name = "") {
+  // Runs `program` with `mode` (see IdentityPeerMain.cpp). Reports a test
+  // failure and returns null when it does not connect and answer.
+  static std::unique_ptr<PeerProcess> start(const std::string& program, const std::string& mode) {
     std::unique_ptr<PeerProcess> peer(new PeerProcess());
-    std::vector<std::string> args = {program, peer->dir_.path() + "/socket", kExecTargetProgram,
-                                     mode};
-    if (!name.empty()) args.push_back(name);
+    std::string args[] = {program, peer->dir_.path + "/socket", kExecTargetProgram, mode};
     internal::UniqueFd listener(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
     struct sockaddr_un address {};
     address.sun_family = AF_UNIX;
     std::strncpy(address.sun_path, args[1].c_str(), sizeof address.sun_path - 1);
-    std::vector<char*> argv;
-    for (std::string& arg : args) argv.push_back(arg.data());
-    argv.push_back(nullptr);
+    char* argv[] = {args[0].data(), args[1].data(), args[2].data(), args[3].data(), nullptr};
     if (::bind(listener.get(), reinterpret_cast<sockaddr*>(&address), sizeof address) != 0 ||
         ::listen(listener.get(), 1) != 0 ||
-        ::posix_spawn(&peer->pid_, program.c_str(), nullptr, nullptr, argv.data(), environ) != 0) {
+        ::posix_spawn(&peer->pid_, program.c_str(), nullptr, nullptr, argv, environ) != 0) {
       peer->pid_ = -1;
       ADD_FAILURE() << "cannot start " << program;
       return nullptr;
     }
-    if (waitReadable(listener.get())) {
+    if (waitReadable(listener.get()))
       peer->connection_.reset(::accept4(listener.get(), nullptr, nullptr, SOCK_CLOEXEC));
-    }
     if (!peer->readByte(&peer->reply_)) {
       ADD_FAILURE() << program << " did not connect and answer";
       return nullptr;
@@ -92,10 +72,8 @@ class PeerProcess {
   }
 
   pid_t pid() const { return pid_; }
-  // The daemon's end of the connection: what fromSocket is given.
-  int connection() const { return connection_.get(); }
-  // 'R' ready, 'S' not permitted here, 'F' failed.
-  char reply() const { return reply_; }
+  int connection() const { return connection_.get(); }  // the daemon's end
+  char reply() const { return reply_; }                 // 'R' ready, 'F' failed
 
   // Makes the peer run the exec target, keeping the connection; true once
   // the target has answered.

@@ -1,22 +1,16 @@
-// Notifications through real counter files: counts and their format, two
-// processes posting at once, observers seeing the last post, cancelling,
-// and the in-memory fake's synchronous delivery.
+// Notifications through real counter files: refused names, two processes posting at once, observers seeing the last post, cancelling.
 #include <gtest/gtest.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
 #include <chrono>
-#include <fstream>
 #include <mutex>
-#include <sstream>
 #include <thread>
 #include <vector>
 
 #include "platform/dispatch/SerialQueue.h"
-#include "platform/log/LogCaptureForTesting.h"
 #include "platform/notify/LinuxNotificationCenter.h"
 #include "platform/notify/NotifyError.h"
-#include "platform/notify/testing/FakeNotificationCenter.h"
 #include "tests/unit/platform_services/ServicesTestSupport.h"
 
 namespace platform::notify {
@@ -52,33 +46,10 @@ class Received {
 
 class PlatformNotifyTest : public ::testing::Test {
  protected:
-  std::string contentsOf(const std::string& name) const {
-    std::stringstream text;
-    text << std::ifstream(directory_ + "/" + name, std::ios::binary).rdbuf();
-    return text.str();
-  }
   services_testing::ScratchDirectory scratch_;
   const std::string directory_ = scratch_ / "run/quorvex/notify";
   std::shared_ptr<dispatch::SerialQueue> queue_ = dispatch::SerialQueue::create("notify-test");
 };
-
-TEST_F(PlatformNotifyTest, PostsCountInADecimalFileRestartingAMalformedOne) {
-  LinuxNotificationCenter center(directory_);
-  EXPECT_EQ(center.currentCount("com.corvane.changed").valueOr(99), 0u);
-  for (int i = 0; i < 3; ++i) ASSERT_TRUE(center.post("com.corvane.changed").ok());
-  EXPECT_EQ(center.currentCount("com.corvane.changed").valueOr(0), 3u);
-  EXPECT_EQ(contentsOf("com.corvane.changed"), "3\n");
-  EXPECT_EQ(center.currentCount("other").valueOr(99), 0u);
-
-  services_testing::writeText(directory_ + "/broken", "twelve\n");
-  Result<std::uint64_t> count = center.currentCount("broken");
-  ASSERT_FALSE(count.ok());
-  EXPECT_TRUE(isNotifyError(count.error(), NotifyErrorCode::MalformedCounter));
-  log::LogCaptureForTesting capture;
-  ASSERT_TRUE(center.post("broken").ok());
-  EXPECT_EQ(contentsOf("broken"), "1\n");
-  EXPECT_EQ(capture.size(), 1u);
-}
 
 TEST_F(PlatformNotifyTest, NamesThatLeaveTheDirectoryAreRefused) {
   LinuxNotificationCenter center(directory_);
@@ -161,28 +132,6 @@ TEST_F(PlatformNotifyTest, CancelledObserversAndThoseOfADestroyedCenterAreNotCal
   EXPECT_TRUE(cancelled.counts().empty());
   EXPECT_TRUE(orphaned.counts().empty());
   orphan.cancel();  // after its center: harmless
-}
-
-TEST(PlatformNotifyFakeTest, CallbacksRunBeforePostReturns) {
-  FakeNotificationCenter fake;
-  auto queue = dispatch::SerialQueue::create("fake-notify");
-  std::vector<std::uint64_t> seen;
-  bool onQueue = true;
-  auto observation = fake.observe("n", queue, [&](std::uint64_t count) {
-    onQueue = onQueue && queue->isCurrent();
-    seen.push_back(count);
-  });
-  ASSERT_TRUE(observation.ok());
-  ASSERT_TRUE(fake.post("n").ok());
-  ASSERT_TRUE(fake.post("n").ok());
-  EXPECT_EQ(seen, (std::vector<std::uint64_t>{1, 2}));
-  EXPECT_TRUE(onQueue);
-  observation->cancel();
-  EXPECT_EQ(fake.observerCountForTesting("n"), 0u);
-  ASSERT_TRUE(fake.post("n").ok());
-  EXPECT_EQ(seen.size(), 2u);
-  EXPECT_EQ(fake.currentCount("n").valueOr(0), 3u);
-  EXPECT_FALSE(fake.post("a/b").ok());
 }
 
 }  // namespace

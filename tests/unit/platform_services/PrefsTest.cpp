@@ -9,8 +9,6 @@
 
 #include "platform/log/LogCaptureForTesting.h"
 #include "platform/prefs/LinuxPreferenceStore.h"
-#include "platform/prefs/testing/FakePreferenceStore.h"
-#include "platform/root/Root.h"
 #include "tests/unit/platform_services/ServicesTestSupport.h"
 
 namespace platform::prefs {
@@ -27,22 +25,6 @@ class PlatformPrefsTest : public ::testing::Test {
   const std::string directory_ = scratch_ / "etc/quorvex/preferences";
   log::LogCaptureForTesting capture_;
 };
-
-TEST_F(PlatformPrefsTest, ReadsValuesUnderTheRootAndFilesThatComeAndGo) {
-  writeVmap(file("com.corvane.qvd"), Dictionary{{"ScanInterval", 30}, {"Verbose", true}});
-  setRootDirectoryForTesting(scratch_.path());
-  LinuxPreferenceStore store;  // finds <root>/etc/quorvex/preferences
-  setRootDirectoryForTesting("/");
-  EXPECT_EQ(store.valueForKey("com.corvane.qvd", "ScanInterval"), Value(30));
-  EXPECT_EQ(store.valueForKey("com.corvane.qvd", "Verbose"), Value(true));
-  EXPECT_TRUE(store.valueForKey("com.corvane.qvd", "Absent").isNone());
-  EXPECT_TRUE(store.valueForKey("late", "k").isNone());
-  writeVmap(file("late"), Dictionary{{"k", 1}});
-  EXPECT_EQ(store.valueForKey("late", "k"), Value(1));
-  ASSERT_EQ(::unlink(file("late").c_str()), 0);
-  EXPECT_TRUE(store.valueForKey("late", "k").isNone());
-  EXPECT_EQ(capture_.size(), 0u);  // a missing file is not a fault
-}
 
 TEST_F(PlatformPrefsTest, SameSizeRewriteIsRead) {
   // Same inode and size; "touched" moves the mtime on, "restored" puts it
@@ -99,9 +81,6 @@ TEST_F(PlatformPrefsTest, DomainNamesThatLeaveTheDirectoryAreRefused) {
                                   std::string_view("x\0y", 3)}) {
     EXPECT_TRUE(store.valueForKey(domain, "k").isNone()) << domain;
   }
-  FakePreferenceStore fake;
-  fake.setValue("..hidden", "k", 1);
-  EXPECT_TRUE(fake.valueForKey("..hidden", "k").isNone());
 }
 
 }  // namespace

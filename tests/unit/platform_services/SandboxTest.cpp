@@ -13,7 +13,6 @@
 
 #include "platform/mbx/identity/PeerIdentity.h"
 #include "platform/sandbox/LinuxSandboxCheck.h"
-#include "platform/sandbox/testing/FakeSandboxCheck.h"
 
 namespace platform::sandbox {
 namespace {
@@ -83,18 +82,6 @@ TEST(PlatformSandboxTest, NoNewPrivsCountsUnlessTheDaemonHasItToo) {
   LinuxSandboxCheck confinedDaemon(confined);
   EXPECT_FALSE(confinedDaemon.isSandboxed(*confined));
   EXPECT_FALSE(confinedDaemon.isSandboxed(*plain));
-}
-
-TEST(PlatformSandboxFakeTest, AnswersWhatTheTestSet) {
-  auto peer = mbx::PeerIdentity::ofSelf();
-  ASSERT_TRUE(peer.ok()) << peer.error().description();
-  FakeSandboxCheck fake;
-  EXPECT_FALSE(fake.isSandboxed(**peer));
-  fake.setForPid((*peer)->pid(), Sandboxing::Sandboxed);
-  EXPECT_TRUE(fake.isSandboxed(**peer));
-  fake.setForPid((*peer)->pid(), Sandboxing::NotSandboxed);
-  fake.setDefault(Sandboxing::Sandboxed);
-  EXPECT_FALSE(fake.isSandboxed(**peer));
 }
 
 }  // namespace

@@ -16,8 +16,7 @@
 
 namespace platform::services_testing {
 
-// A fresh directory under the temporary directory, by its canonical path (so
-// that tests can compare against realpath results).
+// A fresh temporary directory, by its canonical path.
 class ScratchDirectory {
  public:
   ScratchDirectory() {

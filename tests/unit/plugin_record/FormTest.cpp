@@ -93,52 +93,6 @@ TEST_F(FormTest, ReadBackKeepsWhatTheFormCarries) {
   EXPECT_EQ(back->version(), Value("1"));
 }
 
-TEST_F(FormTest, DefaultsAndRecoveries) {
-  auto bare =
-      QVPlugInCore::initWithName("b", url("/S/b"), Value(infoWith({})), std::nullopt, std::nullopt);
-  bare->setOriginalIdentifier("b");
-  Dictionary form = *bare->exportForm(nullptr);
-  EXPECT_EQ(form.get("annotations"), Value(Dictionary{}));
-  EXPECT_FALSE(form.contains("entitlements"));
-  EXPECT_FALSE(form.contains("containingPath"));
-  EXPECT_FALSE(form.contains("localizedDisplayName"));
-
-  // "<none>" is not read back: the version comes from the manifest again.
-  auto versioned = recordAt(
-      "/S/v", infoWith({{"XOExtensionAttributes", Dictionary{{"XOExtensionVersion", "3"}}}}));
-  versioned->setOriginalIdentifier("v");
-  versioned->setPlugInDictionary(Dictionary{});
-  const Dictionary versionForm = *versioned->exportForm(nullptr);
-  EXPECT_EQ(versionForm.get("version"), Value("<none>"));
-  EXPECT_EQ(QVPlugInCore::initWithForm(versionForm)->version(), Value("3"));
-
-  struct Case {
-    const char* what;
-    Value hub;
-    std::uint32_t wantHub;
-    Value uuid;
-    bool sameIdentity;
-  } cases[] = {
-      {"no hub version", Value(), 1, form.get("uuid"), true},
-      {"hub version 2", Value(2), 2, form.get("uuid"), true},
-      {"unparsable uuid", Value(2), 2, Value("not-a-uuid"), false},
-      {"no uuid", Value(), 1, Value(), false},
-  };
-  for (const Case& c : cases) {
-    SCOPED_TRACE(c.what);
-    Dictionary changed = form;
-    changed.set("hubProtocolVersion", c.hub);
-    changed.set("uuid", c.uuid);
-    auto back = QVPlugInCore::initWithForm(changed);
-    ASSERT_TRUE(back);
-    ASSERT_TRUE(back->uuid());
-    EXPECT_EQ(back->hubProtocolVersion(), c.wantHub);
-    EXPECT_EQ(back->isEqual(bare.get()), c.sameIdentity);
-    ASSERT_TRUE(back->annotations());  // an empty dictionary, not none
-    EXPECT_TRUE(back->annotations()->empty());
-  }
-}
-
 TEST_F(FormTest, FormsThatMakeNoRecord) {
   Dictionary good{{"path", "/S/p"}, {"identifier", "p"}, {"bundleInfo", infoWith({})}};
   ASSERT_TRUE(QVPlugInCore::initWithForm(good));
@@ -150,8 +104,6 @@ TEST_F(FormTest, FormsThatMakeNoRecord) {
   } cases[] = {
       {"no path", "path", Value()},
       {"relative path", "path", Value("S/p")},
-      {"no identifier", "identifier", Value()},
-      {"bundleInfo not a dictionary", "bundleInfo", Value(3)},
       {"bundleInfo without XOExtension", "bundleInfo", Value(Dictionary{{"BXBundleName", "n"}})},
   };
   for (const Case& c : cases) {
@@ -195,16 +147,6 @@ TEST_F(FormTest, ExportRefusesARecordMissingABaseKey) {
                                         c.missing);
     EXPECT_FALSE(record->exportForm(nullptr));  // no error slot: still no crash
   }
-}
-
-TEST_F(FormTest, UpdateTakesOnlyAnnotations) {
-  auto record = fullRecord();
-  record->updateFromForm(
-      Dictionary{{"annotations", Dictionary{{"election", 0}}}, {"identifier", "other"}});
-  EXPECT_EQ(*record->annotations(), (Dictionary{{"election", 0}}));
-  EXPECT_EQ(record->identifier(), "com.example.e");
-  record->updateFromForm(Dictionary{});
-  EXPECT_FALSE(record->annotations());
 }
 
 }  // namespace

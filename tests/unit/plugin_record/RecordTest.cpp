@@ -35,34 +35,9 @@ TEST_F(IdentityTest, UuidAloneDecides) {
   EXPECT_FALSE(set.insert(renamed).second);
   EXPECT_TRUE(set.insert(sameName).second);
   EXPECT_EQ(set.size(), 2u);
-  EXPECT_EQ(set.count(renamed), 1u);
-  EXPECT_EQ(std::hash<QVPlugInCore>()(*first), first->hash());
 }
 
 using ConstructionTest = RecordTest;
-
-TEST_F(ConstructionTest, WhereThePlugInDictionaryComesFrom) {
-  const Dictionary fromInfo{{"XOExtensionPointIdentifier", "com.example.point"}};
-  const Dictionary argument{{"XOExtensionPointIdentifier", "from.argument"}};
-
-  auto withInfo = QVPlugInCore::initWithName("p", url("/S/p"), Value(infoWith(fromInfo)), argument,
-                                             std::nullopt);
-  ASSERT_TRUE(withInfo);
-  EXPECT_EQ(*withInfo->plugInDictionary(), fromInfo);
-  EXPECT_EQ(*withInfo->bundleInfoDictionary(), infoWith(fromInfo));
-
-  auto withoutInfo = QVPlugInCore::initWithName("p", url("/S/p"), Value(), argument, kA);
-  ASSERT_TRUE(withoutInfo);
-  EXPECT_EQ(*withoutInfo->plugInDictionary(), argument);
-  EXPECT_FALSE(withoutInfo->bundleInfoDictionary());
-  EXPECT_EQ(withoutInfo->uuid(), kA);
-  EXPECT_EQ(withoutInfo->identifier(), "p");
-
-  auto neither = QVPlugInCore::initWithName("p", url("/S/p"), Value(), std::nullopt, kA);
-  ASSERT_TRUE(neither);
-  EXPECT_FALSE(neither->plugInDictionary());
-  EXPECT_TRUE(neither->pluginKey("XOExtensionPointIdentifier").isNone());
-}
 
 TEST_F(ConstructionTest, RefusalsAndTheirMessages) {
   struct Case {
@@ -94,25 +69,6 @@ TEST_F(ConstructionTest, RefusalsAndTheirMessages) {
   }
 }
 
-TEST_F(ConstructionTest, MultipleIsObsoleteButAccepted) {
-  auto record = recordAt("/S/m", infoWith({{"Multiple", true}}));
-  ASSERT_TRUE(record);
-  EXPECT_TRUE(
-      logged("multiplexed plug-ins (Multiple key) obsolete and ignored", Level::Default, "ops"));
-  EXPECT_FALSE(record->isMultiplexed());
-}
-
-TEST_F(ConstructionTest, SetupLogsTheDisplayName) {
-  auto record = recordAt("/S/d", infoWith({}, {{"BXBundleDisplayName", "Shown"}}));
-  ASSERT_TRUE(record);
-  EXPECT_TRUE(
-      logged("-[QVPlugInCore setupWithName:url:bundleInfo:info:uuid:] Shown", Level::Debug, "hv"));
-  EXPECT_TRUE(logged("-[QVPlugInCore setDictionaries:] Shown", Level::Debug, "ops"));
-  clearLog();
-  record->infoKey("BXBundleDisplayName");
-  EXPECT_TRUE(logged("-[QVPlugInCore infoKey:] BXBundleDisplayName => Shown", Level::Debug, "hv"));
-}
-
 using DerivedTest = RecordTest;
 
 TEST_F(DerivedTest, PropertiesFollowTheManifest) {
@@ -128,7 +84,6 @@ TEST_F(DerivedTest, PropertiesFollowTheManifest) {
   } cases[] = {
       // clang-format off
       {"app extension defaults", "/A.app/PlugIns/e.ovx", {}, object, object, object, "A"},
-      {"plain plug-in without keys", "/System/Library/PlugIns/p.plugin", {}, none, none, none, ""},
       {"suffix is case-sensitive", "/A.app/PlugIns/e.OVX", {}, none, none, none, ""},
       {"data plug-in", "/S/d", {{"XOExtensionProtocol", "#Data"}},
        Value("#Data"), none, Value("#Data"), "T"},
@@ -136,7 +91,6 @@ TEST_F(DerivedTest, PropertiesFollowTheManifest) {
                                      {"PrincipalClass", "Main"}, {"EmbeddedProtocol", "E"}},
        Value(Array{"P1", "P2"}), Value("Main"), Value("E"), ""},
       {"EmbeddedCode false is still hybrid", "/S/h", {{"EmbeddedCode", false}}, none, none, none, "H"},
-      {"Dedicated false", "/S/f", {{"Dedicated", false}}, none, none, none, ""},
       {"Dedicated true", "/S/t", {{"Dedicated", true}}, none, none, none, "D"},
       // clang-format on
   };
@@ -156,44 +110,6 @@ TEST_F(DerivedTest, PropertiesFollowTheManifest) {
     EXPECT_EQ(flags, c.flags);
     EXPECT_FALSE(record->embeddedCodePath());
   }
-}
-
-TEST_F(DerivedTest, AttributesThatAreNotADictionaryCountAsNone) {
-  auto odd = recordAt("/S/o", infoWith({{"XOExtensionAttributes", "flat"}}));
-  ASSERT_TRUE(odd);
-  EXPECT_TRUE(odd->attributes().isNone());
-  EXPECT_TRUE(odd->version().isNone());
-  EXPECT_TRUE(odd->diagnose());
-}
-
-TEST_F(DerivedTest, OldStyle) {
-  auto current = recordAt("/S/n", infoWith({}, {{"Quorvex", true}}));
-  ASSERT_TRUE(current);
-  EXPECT_FALSE(current->oldStyle());  // "XOExtension" decides even beside "Quorvex"
-
-  auto old = QVPlugInCore::init();
-  old->setBundleInfoDictionary(Dictionary{{"Quorvex", Dictionary{}}});
-  EXPECT_TRUE(old->oldStyle());
-  EXPECT_FALSE(loggedAnything("unknown plug-in configuration style"));
-
-  auto neither = QVPlugInCore::init();
-  neither->setBundleInfoDictionary(Dictionary{{"BXBundleName", "n"}});
-  EXPECT_TRUE(neither->oldStyle());
-  EXPECT_TRUE(logged("unknown plug-in configuration style", Level::Fault, "ops"));
-}
-
-TEST_F(DerivedTest, AnnotationChangesReplaceTheDictionary) {
-  auto record = QVPlugInCore::init();
-  record->setAnnotationValue("election", 1);  // no annotations yet: starts from empty
-  ASSERT_TRUE(record->annotations());
-  EXPECT_EQ(*record->annotations(), (Dictionary{{"election", 1}}));
-
-  record->setAnnotationValue("extension", Dictionary{{"k", "v"}});
-  const auto before = record->annotations();
-  record->setAnnotationValue("election", Value());
-  EXPECT_EQ(*record->annotations(), (Dictionary{{"extension", Dictionary{{"k", "v"}}}}));
-  // Whoever read the previous dictionary still holds it unchanged.
-  EXPECT_EQ(*before, (Dictionary{{"election", 1}, {"extension", Dictionary{{"k", "v"}}}}));
 }
 
 }  // namespace

@@ -16,27 +16,15 @@ TEST(SdkMergeTest, PlugInWinsExceptCleanTimeoutAtEveryLevel) {
        {{"CleanTimeout", 30}, {"Dedicated", true}},
        {{"CleanTimeout", 5}, {"Dedicated", false}},
        {{"CleanTimeout", 30}, {"Dedicated", false}}},
-      {"SDK-only keys are copied whatever their kind",
-       {{"n", 1}, {"l", Array{"x"}}, {"d", Dictionary{{"k", "v"}}}},
-       {{"own", "o"}},
-       {{"own", "o"}, {"n", 1}, {"l", Array{"x"}}, {"d", Dictionary{{"k", "v"}}}}},
       {"nested dictionaries merge key by key",
        {{"XOExtension", Dictionary{{"XOExtensionAttributes", Dictionary{{"a", 1}, {"b", 2}}}}}},
        {{"XOExtension", Dictionary{{"XOExtensionAttributes", Dictionary{{"b", 20}, {"c", 30}}}}}},
        {{"XOExtension",
          Dictionary{{"XOExtensionAttributes", Dictionary{{"b", 20}, {"c", 30}, {"a", 1}}}}}}},
-      {"CleanTimeout deep inside",
-       {{"XOExtension", Dictionary{{"CleanTimeout", 60}, {"Dedicated", true}}}},
-       {{"XOExtension", Dictionary{{"CleanTimeout", 1}, {"Dedicated", false}}}},
-       {{"XOExtension", Dictionary{{"CleanTimeout", 60}, {"Dedicated", false}}}}},
       {"a dictionary does not replace a plug-in scalar",
        {{"k", Dictionary{{"x", 1}}}},
        {{"k", "scalar"}},
        {{"k", "scalar"}}},
-      {"a scalar does not replace a plug-in dictionary",
-       {{"k", "scalar"}},
-       {{"k", Dictionary{{"x", 1}}}},
-       {{"k", Dictionary{{"x", 1}}}}},
       {"Shared merges as a set, nested too",
        {{"Shared", Array{"a", "b"}}, {"XOExtension", Dictionary{{"Shared", Array{"a", "b"}}}}},
        {{"Shared", Array{"b", "c"}}, {"XOExtension", Dictionary{{"Shared", Array{"b", "c"}}}}},
@@ -57,44 +45,7 @@ TEST(SdkMergeTest, PlugInWinsExceptCleanTimeoutAtEveryLevel) {
   EXPECT_FALSE(QVPlugInCore::sdkOverridesKey("cleantimeout"));
 }
 
-TEST(SdkMergeTest, SharedResourcesAreASet) {
-  EXPECT_EQ(QVPlugInCore::mergeSharedResourcesInto(Array{"a", "b"}, Array{"b", "c"}),
-            (Array{"b", "c", "a"}));
-  // Duplicates inside one list appear once as well; equality is value equality.
-  EXPECT_EQ(QVPlugInCore::mergeSharedResourcesInto(Array{"x", "x", 1}, Array{"y", "y", true}),
-            (Array{"y", true, "x"}));
-  EXPECT_EQ(QVPlugInCore::mergeSharedResourcesInto(Array{}, Array{}), Array{});
-}
-
 using ResolveTest = RecordTest;
-
-TEST_F(ResolveTest, VersionIsFilledByCanonicalisation) {
-  struct Case {
-    const char* what;
-    Dictionary info;
-    Value want;
-  } cases[] = {
-      {"nothing anywhere", infoWith({}), Value("1")},
-      {"short version string", infoWith({}, {{"BXBundleShortVersionString", "2.3"}}), Value("2.3")},
-      {"own version kept",
-       infoWith({{"XOExtensionAttributes", Dictionary{{"XOExtensionVersion", "4"}, {"k", 1}}}},
-                {{"BXBundleShortVersionString", "2.3"}}),
-       Value("4")},
-  };
-  for (const Case& c : cases) {
-    SCOPED_TRACE(c.what);
-    auto record = recordAt("/S/v", c.info);
-    ASSERT_TRUE(record);
-    FakeSdkRegistry registry;
-    record->resolveSDK(registry);
-    EXPECT_EQ(registry.lookupCount(), 0u);  // no extension point named: no lookup
-    EXPECT_EQ(record->version(), c.want);
-    ASSERT_TRUE(record->plugInDictionary());
-    EXPECT_TRUE(record->plugInDictionary()->get("XOExtensionAttributes").dictionary());
-    // Only the plug-in dictionary is canonical; the info dictionary is as given.
-    EXPECT_EQ(*record->bundleInfoDictionary(), c.info);
-  }
-}
 
 TEST_F(ResolveTest, MergesTheRegisteredSdk) {
   FakeSdkRegistry registry;
@@ -161,21 +112,14 @@ TEST(DiagnoseTest, FirstFailingCheckDecides) {
        nullptr},
       {"no protocol", "/S/np", {{"XOExtensionAttributes", attrs}},
        "missing \"XOExtensionProtocol\" key in Info.vmap or SDK"},
-      {"no attributes", "/S/na", {{"XOExtensionProtocol", "P"}},
-       "missing \"XOExtensionAttributes\" key in Info.vmap or SDK"},
       {"protocol checked before attributes", "/S/nn", {},
        "missing \"XOExtensionProtocol\" key in Info.vmap or SDK"},
-      {"app extension with defaults", "/A.app/PlugIns/e.ovx", {{"XOExtensionAttributes", attrs}},
-       nullptr},
       {"app extension naming a class", "/A.app/PlugIns/e.ovx",
        {{"XOExtensionAttributes", attrs}, {"PrincipalClass", "Mine"}},
        "Application Extensions may not use the \"PrincipalClass\" key"},
       {"PassProxy before EmbeddedCode", "/S/pe", {{"XOExtensionProtocol", "P"},
        {"XOExtensionAttributes", attrs}, {"PassProxy", false}, {"EmbeddedCode", "x"}},
        "the \"PassProxy\" key is not supported on this platform"},
-      {"hybrid", "/S/h", {{"XOExtensionProtocol", "P"}, {"XOExtensionAttributes", attrs},
-       {"EmbeddedCode", false}},
-       "hybrid plug-ins are not supported on this platform"},
       // clang-format on
   };
   for (const Case& c : cases) {

@@ -1,7 +1,6 @@
 #include <gtest/gtest.h>
 
 #include <atomic>
-#include <set>
 #include <thread>
 #include <vector>
 
@@ -26,16 +25,6 @@ TEST(QVErrorsTest, MessageBecomesTheDescription) {
   EXPECT_FALSE(QVErrorIs(e, QVErrorBadPath));
 }
 
-TEST(QVErrorsTest, NoMessageMeansNoUserInformation) {
-  platform::Error e = QVErrorWithCodeMessage(QVErrorBadPath, std::nullopt);
-  EXPECT_EQ(e.code(), 9);
-  EXPECT_EQ(e.domain(), QVQuorvexErrorDomain);
-  EXPECT_FALSE(e.userInfo());
-  EXPECT_EQ(e.localizedDescription(), nullptr);
-  platform::Error f = QVErrorWithCodeFormat(QVErrorBadPath, nullptr);
-  EXPECT_FALSE(f.userInfo());
-}
-
 TEST(QVErrorsTest, FormatFillsInArgumentsWithoutRedaction) {
   platform::Value path("/Applications/A.app/PlugIns/x.ovx");
   platform::Error e = QVErrorWithCodeFormat(QVErrorBadPath, "no plug-in at path:%@", path);
@@ -48,30 +37,6 @@ TEST(QVErrorsTest, FormatFillsInArgumentsWithoutRedaction) {
       QVErrorWithCodeFormat(QVErrorInvalidRequest, "cannot create file extension to %@: %d",
                             std::string("/tmp/x"), 13);
   EXPECT_EQ(s.description(), "cannot create file extension to /tmp/x: 13");
-}
-
-TEST(QVErrorsTest, EveryCodeHasItsName) {
-  const std::pair<QVErrorCode, const char*> codes[] = {
-      {QVErrorRegistryFailure, "QVErrorRegistryFailure"}, {QVErrorInvalidRequest, "QVErrorInvalidRequest"},
-      {QVErrorVersionMismatch, "QVErrorVersionMismatch"}, {QVErrorBadPath, "QVErrorBadPath"},
-      {QVErrorDenied, "QVErrorDenied"},                   {QVErrorInvalidPlugIn, "QVErrorInvalidPlugIn"},
-      {QVErrorBusy, "QVErrorBusy"},                       {QVErrorNotFound, "QVErrorNotFound"},
-      {QVErrorInvalidValue, "QVErrorInvalidValue"}};
-  for (const auto& [code, name] : codes) EXPECT_STREQ(QVErrorCodeName(code), name);
-  EXPECT_EQ(QVErrorCodeName(0), nullptr);
-  EXPECT_EQ(QVErrorCodeName(3), nullptr);
-}
-
-TEST(QVLogTest, CategoriesAreDistinctLogsOfTheSubsystem) {
-  const platform::log::Logger* logs[] = {&QVLogOps(), &QVLogTraffic(), &QVLogExtension(),
-                                         &QVLogHV(), &QVLogSandbox()};
-  const char* names[] = {"ops", "traffic", "extension", "hv", "sandbox"};
-  std::set<const platform::log::Logger*> distinct(std::begin(logs), std::end(logs));
-  EXPECT_EQ(distinct.size(), 5u);
-  for (int i = 0; i < 5; ++i) {
-    EXPECT_EQ(logs[i]->subsystem(), "com.corvane.Quorvex");
-    EXPECT_EQ(logs[i]->category(), names[i]);
-  }
 }
 
 TEST(QVLogTest, ConcurrentFirstUseGivesOneLog) {
@@ -105,13 +70,6 @@ TEST(QVLogTest, FailedCreationFallsBackToTheDefaultLog) {
   EXPECT_EQ(lines[0].level, Level::Error);
   // "%s" is not marked public, so the category name is redacted in the log.
   EXPECT_EQ(lines[0].message, "unable to create tracelog for category <private>");
-}
-
-TEST(QVLogTest, DiagnosticFailureLevelFollowsTheVariant) {
-  // Computed once: the same answer however often it is asked.
-  bool first = QVInternalDiagnostics();
-  EXPECT_EQ(QVInternalDiagnostics(), first);
-  EXPECT_EQ(QVDiagnosticFailureLevel(), first ? Level::Fault : Level::Error);
 }
 
 }  // namespace

@@ -1,6 +1,5 @@
-// Request envelopes and dispatch through a server in this process, over real
-// connections: version and name checks, the order of checks, requests of a
-// client that has died, synchronous submission, and finishing exactly once.
+// Request envelopes and dispatch over real connections: version and name
+// checks, requests of a dead client, synchronous submission, finishing once.
 #include <gtest/gtest.h>
 
 #include <future>
@@ -8,7 +7,6 @@
 #include "Quorvex/QVDConstants.h"
 #include "Quorvex/QVErrors.h"
 #include "platform/log/LogCaptureForTesting.h"
-#include "platform/log/LoggerRegistry.h"
 #include "qvd/Transaction.h"
 #include "tests/unit/qvd/QvdTestSupport.h"
 
@@ -25,87 +23,41 @@ class DispatchTest : public ::testing::Test {
 };
 
 TEST_F(DispatchTest, EnvelopeErrors) {
-  struct Case {
-    const char* what;
-    Dictionary request;
-    ErrorReply expected;
-  };
-  auto withVersion = [](Value version) {
-    Dictionary d = request("match");
+  auto with = [](Value name, Value version) {
+    Dictionary d = request("");
+    d.set(QVDRequestKey, std::move(name));
     d.set(QVDVersionKey, std::move(version));
     return d;
   };
-  auto withName = [](Value name) {
-    Dictionary d = request("x");
-    d.set(QVDRequestKey, std::move(name));
-    return d;
-  };
-  const std::vector<Case> cases = {
-      {"version 1", withVersion(1), {7, "unsupported protocol version 1 (current 3)"}},
-      {"version 4", withVersion(4), {7, "unsupported protocol version 4 (current 3)"}},
-      {"no version", withVersion(Value()), {7, "unsupported protocol version 0 (current 3)"}},
-      {"version as text", withVersion("3"), {7, "unsupported protocol version 0 (current 3)"}},
-      {"version as boolean", withVersion(true), {7, "unsupported protocol version 0 (current 3)"}},
-      {"negative version", withVersion(-3), {7, "unsupported protocol version 0 (current 3)"}},
-      {"no name", withName(Value()), {4, "invalid request format (missing type)"}},
-      {"name not text", withName(42), {4, "invalid request format (missing type)"}},
-      {"unknown name", withName("frobnicate"), {4, "unrecognized request"}},
-      {"names are case-sensitive", withName("Match"), {4, "unrecognized request"}},
-      {"version 2 is accepted", [&] {
-         Dictionary d = withName("nope");
-         d.set(QVDVersionKey, 2);
-         return d;
-       }(), {4, "unrecognized request"}},
+  const std::vector<std::pair<Dictionary, ErrorReply>> cases = {
+      {with("match", 1), {7, "unsupported protocol version 1 (current 3)"}},
+      {with("match", 4), {7, "unsupported protocol version 4 (current 3)"}},
+      {with("match", "3"), {7, "unsupported protocol version 0 (current 3)"}},
+      {with(42, 3), {4, "invalid request format (missing type)"}},
+      {with("Match", 3), {4, "unrecognized request"}},  // names are case-sensitive
+      {with("nope", 2), {4, "unrecognized request"}},   // version 2 is accepted
   };
   TestClient client(server_);
-  for (const Case& c : cases) {
-    auto reply = client.call(c.request);
-    ASSERT_TRUE(reply.ok()) << c.what;
-    EXPECT_EQ(errorOf(*reply), c.expected) << c.what;
-    EXPECT_EQ(reply->dictionary()->size(), 2u) << c.what << ": only the error keys";
+  for (const auto& [message, expected] : cases) {
+    auto reply = client.call(message);
+    ASSERT_TRUE(reply.ok());
+    EXPECT_EQ(errorOf(*reply), expected) << Value(message).description();
+    EXPECT_EQ(reply->dictionary()->size(), 2u) << "only the error keys";
   }
-  // Every table name reaches its handler; until they are served they are
-  // refused exactly as an unknown name is.
-  for (auto name : {QVDAddRequest, QVDRemoveRequest, QVDBulkRequest, QVDMatchRequest,
-                    QVDReadyRequest, QVDAccessRequest, QVDAnnotateRequest, QVDBulkAnnotateRequest,
-                    QVDLockdownRequest, QVDFindRequest}) {
+  // Table names not yet served are refused exactly as an unknown name is.
+  for (auto name : {QVDAddRequest, QVDMatchRequest, QVDLockdownRequest, QVDFindRequest}) {
     auto reply = client.call(request(name));
     ASSERT_TRUE(reply.ok());
     EXPECT_EQ(errorOf(*reply), (ErrorReply{4, "unrecognized request"})) << name;
   }
 }
 
-TEST_F(DispatchTest, TableNamesCannotBeTakenOverAndTestRoutesAnswer) {
-  int calls = 0;
-  Transaction::addRequestForTesting("match", [&](Transaction& t) {
-    ++calls;
-    t.done();
-  });
-  Transaction::addRequestForTesting("echo", [](Transaction& t) {
-    t.reply().set("echo", t.request().get("payload"));
-    t.reply().set("version", t.version());
-    t.done();
-  });
-  TestClient client(server_);
-  Dictionary echo = request("echo");
-  echo.set("payload", Dictionary{{"nested", platform::Array{1, "two"}}});
-  auto reply = client.call(echo);
-  ASSERT_TRUE(reply.ok());
-  EXPECT_EQ(reply->dictionary()->get("echo"), echo.get("payload"));
-  EXPECT_EQ(reply->dictionary()->get("version"), Value(3));
-  EXPECT_EQ(errorOf(client.call(request("match")).value()).code, 4u);
-  EXPECT_EQ(calls, 0);
-}
-
 TEST_F(DispatchTest, MessageThatIsNotADictionaryIsLoggedAndTheConnectionStaysOpen) {
   platform::log::LogCaptureForTesting capture;
   TestClient client(server_);
-  client.connection()->sendWithReply(Value(platform::Array{"not", "a", "request"}),
-                                     platform::dispatch::SerialQueue::create("t"),
-                                     [](platform::Result<platform::mbx::Message> reply) {
-                                       // Only the connection's end completes it.
-                                       EXPECT_FALSE(reply.ok()) << "a message that is no request was answered";
-                                     });
+  client.connection()->sendWithReply(
+      Value(platform::Array{"not", "a", "request"}), platform::dispatch::SerialQueue::create("t"),
+      [](platform::Result<platform::mbx::Message> reply) { EXPECT_FALSE(reply.ok()); });
   // Delivered in order: once this is answered, the array has been handled.
   auto reply = client.call(request("nope"));
   ASSERT_TRUE(reply.ok());
@@ -117,23 +69,16 @@ TEST_F(DispatchTest, MessageThatIsNotADictionaryIsLoggedAndTheConnectionStaysOpe
   EXPECT_TRUE(logged);
 }
 
-// Holds the service queue inside a handler until released, so that requests
-// queue up behind it.
-class ServiceQueueBlocker {
- public:
+// Holds the service queue inside a "block" handler until released.
+struct ServiceQueueBlocker {
+  std::promise<void> entered, released;
   ServiceQueueBlocker() {
     Transaction::addRequestForTesting("block", [this](Transaction& t) {
-      entered_.set_value();
-      release_.get_future().wait();
+      entered.set_value();
+      released.get_future().wait();
       t.done();
     });
   }
-  void waitUntilBlocked() { entered_.get_future().wait(); }
-  void release() { release_.set_value(); }
-
- private:
-  std::promise<void> entered_;
-  std::promise<void> release_;
 };
 
 TEST_F(DispatchTest, QueuedRequestOfADeadClientIsDroppedUnlessItWasSynchronous) {
@@ -147,7 +92,7 @@ TEST_F(DispatchTest, QueuedRequestOfADeadClientIsDroppedUnlessItWasSynchronous) 
     });
     TestClient holder(server_);
     holder.callAsync(request("block"));
-    blocker.waitUntilBlocked();
+    blocker.entered.get_future().wait();
 
     const std::size_t before = server_.clients().size();
     TestClient dying(server_);
@@ -165,7 +110,7 @@ TEST_F(DispatchTest, QueuedRequestOfADeadClientIsDroppedUnlessItWasSynchronous) 
       std::this_thread::sleep_for(50ms);
       EXPECT_TRUE(client->acceptWork());
     }
-    blocker.release();
+    blocker.released.set_value();
     ASSERT_TRUE(eventually([&] { return holder.asyncReplyCount() == 1; }));
     // Anything queued after the blocker has run once this answers.
     TestClient probe(server_);
@@ -196,31 +141,6 @@ TEST_F(DispatchTest, ADeadClientGetsOnlyVersionErrors) {
   // Dispatched in order: the earlier request was dropped without a reply.
   EXPECT_EQ(client.asyncReplyCount(), 0u);
   EXPECT_EQ(handled, 0);
-}
-
-TEST_F(DispatchTest, EveryThousandthRequestOfAClientIsLogged) {
-  platform::log::LoggerRegistry::shared().applyFilterForTesting("debug");
-  platform::log::LogCaptureForTesting capture;
-  TestClient client(server_);
-  for (int i = 0; i < 999; ++i) client.callAsync(request("nope"));
-  ASSERT_TRUE(eventually([&] { return client.asyncReplyCount() == 999; }))
-      << client.asyncReplyCount() << " replies; last "
-      << (client.asyncReplies().back().ok() ? client.asyncReplies().back()->description()
-                                            : client.asyncReplies().back().error().description());
-  auto countLines = [&] {
-    int n = 0;
-    for (const auto& line : capture.messages()) {
-      if (line.find("requests so far") != std::string::npos) {
-        EXPECT_NE(line.find(" used 1000 requests so far"), std::string::npos) << line;
-        ++n;
-      }
-    }
-    return n;
-  };
-  EXPECT_EQ(countLines(), 0);
-  ASSERT_TRUE(client.call(request("nope")).ok());
-  EXPECT_EQ(countLines(), 1);
-  platform::log::LoggerRegistry::shared().applyFilterForTesting("");
 }
 
 TEST_F(DispatchTest, FinishingTwiceSendsOneReplyAndADeferredReplyToAGoneClientIsDropped) {

@@ -1,6 +1,5 @@
-// Entitlements follow the client's executable: two programs talking to the
-// same server get the grants written for each of them on disk, and a grant
-// file that anyone may write grants nothing.
+// Entitlements follow the client's executable: two programs talking to one
+// server get their own grants from disk; a world-writable grant grants nothing.
 #include <gtest/gtest.h>
 #include <spawn.h>
 #include <sys/stat.h>
@@ -33,24 +32,21 @@ class EntitlementGrantTest : public ::testing::Test {
   }
   void TearDown() override { std::filesystem::remove_all(grants_); }
 
-  void grant(const std::string& file, const std::string& executable, Dictionary entitlements,
-             mode_t mode = 0644) {
-    const std::string path = grants_ + "/" + file;
-    Dictionary document{{"executable", executable}, {"entitlements", std::move(entitlements)}};
+  static void write(const std::string& path, const Dictionary& document) {
     ASSERT_TRUE(platform::vmap::writeFileAtomically(path, Value(document), platform::vmap::Format::Xml,
                                                     platform::vmap::FileOps::real())
                     .ok());
-    ::chmod(path.c_str(), mode);
+  }
+  void grant(const std::string& file, const std::string& executable, Dictionary entitlements,
+             mode_t mode = 0644) {
+    write(grants_ + "/" + file, {{"executable", executable}, {"entitlements", entitlements}});
+    ::chmod((grants_ + "/" + file).c_str(), mode);
   }
 
-  // Runs the request client (another program) against `server`; answers
-  // its exit status.
+  // Runs the request client (another program) against `server`: its status.
   int runOtherProgram(const TestServer& server) {
     const std::string request = platform::rootPath("grant-request.vmap");
-    Dictionary body = testing::request("nope");
-    EXPECT_TRUE(platform::vmap::writeFileAtomically(request, Value(body), platform::vmap::Format::Xml,
-                                                    platform::vmap::FileOps::real())
-                    .ok());
+    write(request, testing::request("nope"));
     std::vector<std::string> args{REQUEST_CLIENT_PATH, "--service", server.serviceName(), request};
     std::vector<char*> argv;
     for (auto& a : args) argv.push_back(a.data());

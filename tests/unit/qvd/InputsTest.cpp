@@ -1,6 +1,5 @@
-// The shared request inputs, driven over real connections through requests
-// that tests register: "paths" read and resolved on the file system, and
-// "uuids" resolved to plug-ins, by path when a UUID is unknown.
+// The shared request inputs over real connections: "paths" resolved on the
+// file system, and "uuids" resolved to plug-ins, by path when unknown.
 #include <gtest/gtest.h>
 #include <unistd.h>
 
@@ -55,25 +54,17 @@ class InputsTest : public ::testing::Test {
     std::filesystem::remove_all(dir_);
   }
 
-  Value call(Dictionary request) {
-    TestClient client(server_);
-    auto reply = client.call(request);
-    EXPECT_TRUE(reply.ok());
-    return reply.ok() ? *reply : Value();
-  }
+  Value call(Dictionary request) { return TestClient(server_).call(request).value(); }
 
-  // Registers a plug-in at `path` with the server's registration service
-  // (a service plug-in with a data container, so that it passes validation)
-  // and answers its UUID.
+  // Registers a valid plug-in at `path`; answers its UUID.
   Uuid registerPlugIn(const std::string& path) {
     platform::holvane::PlugInRecord record;
     record.uuid = Uuid::generate();
     record.path = path;
     record.identifier = "com.example.inputs." + std::filesystem::path(path).stem().string();
     record.dataContainer = platform::rootPath("var/containers/Data/" + record.identifier);
-    record.info = Dictionary{
-        {"XOExtension", Dictionary{{"XOExtensionProtocol", "p"},
-                                   {"XOExtensionAttributes", Dictionary{}}}}};
+    record.info = Dictionary{{"XOExtension", Dictionary{{"XOExtensionProtocol", "p"},
+                                                        {"XOExtensionAttributes", Dictionary{}}}}};
     server_.fakes().registry->put(record);
     return record.uuid;
   }
@@ -92,19 +83,14 @@ TEST_F(InputsTest, Paths) {
   };
   const std::vector<Case> cases = {
       {"a single text is not a list", Value(dir_), Value(), {4, "invalid request format"}},
-      {"absent", Value(), Value(), {4, "invalid request format"}},
       {"an element not text", Array{dir_, 7}, Array{Array{dir_, true}},
        {4, "invalid request format"}},
       {"relative after absolute", Array{dir_ + "/real", "rel/x"}, Array{Array{real, true}},
        {9, "absolute path required: rel/x"}},
-      {"empty text", Array{""}, Value(), {9, "absolute path required: "}},
       {"missing path handed on unresolved", Array{dir_ + "/nothing/here"},
        Array{Array{dir_ + "/nothing/here", false}}, {}},
       {"link resolved to its target", Array{dir_ + "/link/file"},
        Array{Array{real + "/file", true}}, {}},
-      {"dot segments resolved", Array{dir_ + "/real/../real/./file"},
-       Array{Array{real + "/file", true}}, {}},
-      {"empty list passes", Array{}, Value(), {}},
   };
   for (const Case& c : cases) {
     Dictionary r = request("paths");
@@ -129,13 +115,11 @@ TEST_F(InputsTest, Uuids) {
     ErrorReply error;
   };
   const std::vector<Case> cases = {
-      {"absent", Value(), Value(), Value(), {4, "invalid request format (uuid)"}},
       {"one UUID, not a list", Value(known), Value(), Value(), {4, "invalid request format (uuid)"}},
       {"an element not a UUID", Array{known, known.toString()}, Value(), Value(),
        {4, "invalid request (bad uuid array)"}},
       {"unknown without paths", Array{unknown}, Value(), Value(),
        {4, "no such plugin (uuid not found)"}},
-      {"empty list", Array{}, Value(), Array{}, {}},
       {"known", Array{known, known}, Value(), Array{knownPath, knownPath}, {}},
       {"unknown found by its parallel path", Array{known, unknown},
        Array{knownPath, byPathPath},
@@ -143,12 +127,6 @@ TEST_F(InputsTest, Uuids) {
       {"paths of another length are ignored", Array{known, unknown, known},
        Array{byPathPath, byPathPath}, Value(),
        {4, "no such plugin (uuid not found)"}},
-      {"paths that are no list are ignored", Array{unknown}, Value(byPathPath), Value(),
-       {4, "no such plugin (uuid not found)"}},
-      {"a parallel path that is no text", Array{unknown}, Array{7}, Value(),
-       {4, "no such plugin (uuid not found)"}},
-      {"a relative parallel path finds nothing", Array{unknown}, Array{"System/ByPath.ovx"},
-       Value(), {4, "no such plugin (uuid not found)"}},
   };
   for (const Case& c : cases) {
     Dictionary r = request("uuids");

@@ -9,19 +9,11 @@
 
 namespace qvd::testing {
 
-namespace {
-
-std::atomic<int> gServerSerial{0};
-
-}  // namespace
-
-// One root for the whole test process: the root may only change while no
-// other thread reads it, and the dispatch pool's threads outlive each test.
+// One root per process: the dispatch pool's threads outlive each test.
 const std::string& testRoot() {
   static const std::string root = [] {
     char pattern[] = "/tmp/qvd-test-XXXXXX";
-    const char* made = ::mkdtemp(pattern);
-    std::string path = made != nullptr ? made : "/tmp";
+    std::string path = ::mkdtemp(pattern);
     platform::setRootDirectoryForTesting(path);
     ::setenv("QV_ROOT", path.c_str(), 1);
     return path;
@@ -30,16 +22,9 @@ const std::string& testRoot() {
 }
 
 Platform FakePlatform::platform() const {
-  Platform services;
-  services.entitlements = entitlements;
-  services.sandbox = sandbox;
-  services.preferences = preferences;
-  services.notifications = notifications;
-  services.containers = containers;
-  services.registry = registry;
-  services.locale = locale;
-  services.extensions = extensions;
-  return services;
+  return Platform{.entitlements = entitlements, .sandbox = sandbox, .preferences = preferences,
+                  .notifications = notifications, .containers = containers, .registry = registry,
+                  .locale = locale, .extensions = extensions};
 }
 
 bool eventually(const std::function<bool()>& done, std::chrono::milliseconds limit) {
@@ -55,7 +40,8 @@ TestServer::TestServer() : TestServer([](Platform&) {}) {}
 
 TestServer::TestServer(const std::function<void(Platform&)>& adjust) {
   (void)testRoot();
-  serviceName_ = "qvd.test." + std::to_string(::getpid()) + "." + std::to_string(++gServerSerial);
+  static std::atomic<int> serial{0};
+  serviceName_ = "qvd.test." + std::to_string(::getpid()) + "." + std::to_string(++serial);
   Platform services = fakes_.platform();
   adjust(services);
   server_ = QVDServer::initForService(serviceName_, std::nullopt, std::move(services),
@@ -99,27 +85,11 @@ platform::Result<platform::Value> TestClient::call(const platform::Dictionary& r
 }
 
 void TestClient::callAsync(const platform::Dictionary& request) {
-  // The handler may outlive this object (the connection's end completes
-  // what is still awaited), so it writes to state it shares.
+  // The handler may outlive this object, so it counts in shared state.
   connection_->sendWithReply(platform::Value(request), replyQueue_,
-                             [replies = replies_](platform::Result<platform::mbx::Message> reply) {
-                               std::lock_guard<std::mutex> lock(replies->mu);
-                               if (reply.ok()) {
-                                 replies->list.emplace_back(reply->body());
-                               } else {
-                                 replies->list.emplace_back(reply.error());
-                               }
+                             [replies = replies_](platform::Result<platform::mbx::Message>) {
+                               ++*replies;
                              });
-}
-
-std::vector<platform::Result<platform::Value>> TestClient::asyncReplies() const {
-  std::lock_guard<std::mutex> lock(replies_->mu);
-  return replies_->list;
-}
-
-std::size_t TestClient::asyncReplyCount() const {
-  std::lock_guard<std::mutex> lock(replies_->mu);
-  return replies_->list.size();
 }
 
 platform::Dictionary request(std::string_view name) {

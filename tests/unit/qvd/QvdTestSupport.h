@@ -1,6 +1,5 @@
-// An in-process daemon for tests: a server on a temporary platform root with
-// fake platform services, and clients that speak to it over real
-// connections.
+// An in-process daemon for tests: a server on a temporary root with fake
+// platform services, and clients over real connections.
 #pragma once
 
 #include <atomic>
@@ -28,7 +27,6 @@ namespace qvd::testing {
 
 using namespace std::chrono_literals;
 
-// The fakes behind a test server, kept so that tests can set their answers.
 struct FakePlatform {
   std::shared_ptr<platform::codesign::FakeEntitlementStore> entitlements =
       std::make_shared<platform::codesign::FakeEntitlementStore>();
@@ -49,26 +47,21 @@ struct FakePlatform {
   Platform platform() const;
 };
 
-// The temporary platform root of this test process, made (and set as the
-// root) on first use. Call it before computing any path under the root.
+// The temporary platform root of this process, made and set on first use.
 const std::string& testRoot();
 
-// Polls `done` until it holds or `limit` passes.
 bool eventually(const std::function<bool()>& done, std::chrono::milliseconds limit = 10s);
 
-// A server listening under a service name of its own, on the process's
-// temporary root (made once per process). Records every client it makes.
+// A server under a service name of its own. Records every client it makes.
 class TestServer {
  public:
   TestServer();
-  // With some fakes replaced by real services before the server is made.
   explicit TestServer(const std::function<void(Platform&)>& adjust);
   ~TestServer();
 
   const std::shared_ptr<QVDServer>& server() const { return server_; }
   FakePlatform& fakes() { return fakes_; }
   const std::string& serviceName() const { return serviceName_; }
-  // The clients made so far, in order.
   std::vector<std::shared_ptr<QVDMbxClient>> clients() const;
 
  private:
@@ -79,20 +72,16 @@ class TestServer {
   std::vector<std::shared_ptr<QVDMbxClient>> clients_;
 };
 
-// A connection to a TestServer.
 class TestClient {
  public:
   explicit TestClient(const TestServer& server);
   ~TestClient();
 
-  // Sends `request` and waits for its reply: the reply body, or the
-  // connection's error.
+  // The reply body, or the connection's error.
   platform::Result<platform::Value> call(const platform::Dictionary& request);
-  // Sends `request` with a reply handler that records the reply (or error)
-  // in arrival order.
+  // Sends `request`; replies are counted as they arrive.
   void callAsync(const platform::Dictionary& request);
-  std::vector<platform::Result<platform::Value>> asyncReplies() const;
-  std::size_t asyncReplyCount() const;
+  std::size_t asyncReplyCount() const { return replies_->load(); }
 
   void cancel() { connection_->cancel(); }
   const std::shared_ptr<platform::mbx::Connection>& connection() const { return connection_; }
@@ -100,14 +89,10 @@ class TestClient {
  private:
   std::shared_ptr<platform::mbx::Connection> connection_;
   std::shared_ptr<platform::dispatch::SerialQueue> replyQueue_;
-  struct Replies {
-    std::mutex mu;
-    std::vector<platform::Result<platform::Value>> list;
-  };
-  const std::shared_ptr<Replies> replies_ = std::make_shared<Replies>();
+  const std::shared_ptr<std::atomic<std::size_t>> replies_ =
+      std::make_shared<std::atomic<std::size_t>>(0);
 };
 
-// A request of `name` at the current protocol version.
 platform::Dictionary request(std::string_view name);
 // The "errorcode" and "error" of a reply ({0, ""} for a success).
 struct ErrorReply {

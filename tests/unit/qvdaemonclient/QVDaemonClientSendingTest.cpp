@@ -3,8 +3,6 @@
 // is not running, goes away or comes back; values across a real connection.
 #include <gtest/gtest.h>
 
-#include <stdlib.h>
-
 #include <atomic>
 #include <thread>
 
@@ -13,7 +11,6 @@
 #include "Quorvex/QVErrors.h"
 #include "platform/dispatch/Semaphore.h"
 #include "platform/log/LogCaptureForTesting.h"
-#include "platform/log/LoggerRegistry.h"
 #include "tests/unit/mbx/MbxTestSupport.h"
 #include "tests/unit/qvdaemonclient/FakeDaemon.h"
 
@@ -122,38 +119,6 @@ TEST_F(QVDaemonClientSending, ADaemonThatGoesAwayFailsWaitingRequestsIsLoggedAnd
   EXPECT_TRUE(again.reply->ok()) << again.reply->error().description();
 }
 
-TEST_F(QVDaemonClientSending, RequestsAndRepliesAreLoggedToTrafficAndFindsToOps) {
-  qvdtest::FakeDaemon daemon("qvd.logs");
-  daemon.answerWith(Dictionary{{"answer", 42}});
-  auto qvd = client("qvd.logs");
-  // Messages are redacted unless QV_LOG_PRIVATE says otherwise.
-  auto& registry = platform::log::LoggerRegistry::shared();
-  ::setenv("QV_LOG_PRIVATE", "1", 1);
-  registry.reloadEnvironmentForTesting();
-  registry.applyFilterForTesting("traffic=debug");
-  LogCaptureForTesting capture(CaptureEcho::Silent);
-  const platform::Uuid uuid = *platform::Uuid::parse("6F1A0C2E-3B7D-4C55-9E0A-1D2B3C4D5E6F");
-  Seen seen;
-  qvd->findPlugInByUUID(uuid, seen.handler(qvd));
-  seen.done.wait();
-  ::unsetenv("QV_LOG_PRIVATE");
-  registry.reloadEnvironmentForTesting();
-  registry.applyFilterForTesting("");
-  std::vector<std::string> traffic;
-  bool foundFind = false;
-  for (const auto& line : capture.lines()) {
-    if (line.category == "traffic") traffic.push_back(line.message);
-    if (line.category == "ops" && line.message == "findPlugInByUUID " + uuid.toString()) {
-      foundFind = line.level == platform::log::Level::Default;
-    }
-  }
-  EXPECT_TRUE(foundFind);
-  ASSERT_EQ(traffic.size(), 2u);
-  EXPECT_EQ(traffic[0].rfind("request: ", 0), 0u) << traffic[0];
-  EXPECT_NE(traffic[0].find(uuid.toString()), std::string::npos);
-  EXPECT_EQ(traffic[1], "reply: " + Value(Dictionary{{"answer", 42}}).description());
-}
-
 TEST_F(QVDaemonClientSending, SynchronousMatchCarriesNestedValuesBothWays) {
   qvdtest::FakeDaemon daemon("qvd.values");
   daemon.answerWith([](const Dictionary& request) {
@@ -184,11 +149,6 @@ TEST_F(QVDaemonClientSending, SynchronousMatchCarriesNestedValuesBothWays) {
   EXPECT_TRUE(back.dictionary()->get("date").date());
   EXPECT_TRUE(back.dictionary()->get("uuid").uuid());
   EXPECT_TRUE(back.dictionary()->get("data").data());
-
-  // A client speaking another version neither reads wire values nor says 3.
-  qvd->setProtocolVersionForTesting(2);
-  EXPECT_TRUE(qvd->convertFromMBX(wire).isNone());
-  EXPECT_EQ(qvd->request("bulk").get("version"), Value(2));
 }
 
 }  // namespace

@@ -87,10 +87,6 @@ TEST_F(QvctlEndToEnd, ErrorRepliesAndUnreachableDaemonsExitWithStatus1) {
        {{"errorcode", 9}, {"error", "no plug-in at /x"}},
        {"--service", "qvd.cli", "remove", "/x"},
        "qvctl: error 9: no plug-in at /x\n"},
-      {"error without text",
-       {{"errorcode", 14}},
-       {"--service", "qvd.cli", "bulk"},
-       "qvctl: error 14: unknown error returned by Quorvex subsystem\n"},
       {"protocol broken",
        {{"error", "half"}},
        {"--service", "qvd.cli", "bulk"},
@@ -111,31 +107,6 @@ TEST_F(QvctlEndToEnd, ErrorRepliesAndUnreachableDaemonsExitWithStatus1) {
   ToolRun absent = run({"--service", "qvd.nobody", "add", "x"});
   EXPECT_EQ(absent.status, 1);
   EXPECT_EQ(absent.err.rfind("qvctl: error 4: service unavailable", 0), 0u) << absent.err;
-}
-
-TEST_F(QvctlEndToEnd, RepliesArePrintedForPeopleOrAsJson) {
-  const platform::Uuid token = *platform::Uuid::parse("E621E1F8-C36C-495A-93FC-0C247A3E6E5F");
-  daemon_.answerWith(Dictionary{
-      {"matches", Array{Dictionary{{"XOExtensionIdentifier", "com.a"}}, Dictionary{{"n", 1}}}},
-      {"uuids", Array{Value(token)}}});
-  ToolRun human = run({"--service=qvd.cli", "match", "XOExtensionPointName=com.corvane.share"});
-  EXPECT_EQ(human.status, 0) << human.err;
-  EXPECT_EQ(human.out,
-            "2 plug-ins\nplug-in 1:\n  XOExtensionIdentifier: com.a\nplug-in 2:\n  n: 1\n");
-  EXPECT_EQ(daemon_.request(1).get("rules"),
-            Value(Dictionary{{"XOExtensionPointName", "com.corvane.share"}}));
-
-  ToolRun json = run({"--service", "qvd.cli", "--json", "find", "Rel/A.app"});
-  EXPECT_EQ(json.status, 0) << json.err;
-  EXPECT_NE(json.out.find("\"XOExtensionIdentifier\": \"com.a\""), std::string::npos) << json.out;
-  EXPECT_NE(json.out.find("\"E621E1F8-C36C-495A-93FC-0C247A3E6E5F\""), std::string::npos);
-  // The relative path went out absolute, as a file URL.
-  EXPECT_EQ(daemon_.request(2).get("paths"), Value("file:///work/dir/Rel/A.app"));
-
-  ToolRun hold = run({"--service", "qvd.cli", "hold", "--flags", "1", "a", "/b"});
-  EXPECT_EQ(hold.status, 0) << hold.err;
-  EXPECT_EQ(hold.out, token.toString() + "\n");
-  EXPECT_EQ(daemon_.request(3).get("paths"), Value(Array{"/work/dir/a", "/b"}));
 }
 
 TEST_F(QvctlEndToEnd, WatchPrintsALinePerChangeAndStopsAtItsCount) {

@@ -1,6 +1,4 @@
-// Shared pieces of the registry-backed plug-in tests: a temporary platform
-// root, fake services, a log capture that sees every level, and builders for
-// registration records and strings tables.
+// Shared pieces of the registry-backed plug-in tests.
 #pragma once
 
 #include <gtest/gtest.h>
@@ -11,8 +9,6 @@
 #include <fstream>
 #include <memory>
 #include <string>
-#include <string_view>
-#include <vector>
 
 #include "platform/holvane/testing/FakeRegistry.h"
 #include "platform/locale/testing/FakeLocaleService.h"
@@ -46,9 +42,7 @@ class RegistryPlugInTest : public ::testing::Test {
     platform::log::LoggerRegistry::shared().reloadEnvironmentForTesting();
     capture_ = std::make_unique<platform::log::LogCaptureForTesting>();
     char pattern[] = "/tmp/qvd-regplugin-XXXXXX";
-    const char* made = ::mkdtemp(pattern);
-    ASSERT_NE(made, nullptr);
-    root_ = made;
+    root_ = ::mkdtemp(pattern);
     platform::setRootDirectoryForTesting(root_);
   }
   void TearDown() override {
@@ -59,10 +53,6 @@ class RegistryPlugInTest : public ::testing::Test {
     platform::log::LoggerRegistry::shared().reloadEnvironmentForTesting();
   }
 
-  QVDPlugIn::Services services() const { return {registry_, locale_, extensions_}; }
-
-  // A record of a non-data plug-in with a data container, at `relative`
-  // under the root, identified as `identifier` (also its bundle identifier).
   PlugInRecord record(std::string_view relative, std::string identifier = "com.example.plugin",
                       Dictionary plugIn = validPlugInDictionary()) const {
     PlugInRecord r;
@@ -76,13 +66,11 @@ class RegistryPlugInTest : public ::testing::Test {
     return r;
   }
 
-  // Registers `r` with the fake registry, then builds the plug-in from it.
   std::shared_ptr<QVDPlugIn> make(const PlugInRecord& r) {
     registry_->put(r);
-    return QVDPlugIn::initWithHVData(r, services());
+    return QVDPlugIn::initWithHVData(r, {registry_, locale_, extensions_});
   }
 
-  // Writes <bundle>/locale/<lang>/<table>.vmap.
   static void writeTable(const std::string& bundle, std::string_view lang, std::string_view table,
                          const Dictionary& strings) {
     const std::string dir = bundle + "/locale/" + std::string(lang);
@@ -92,14 +80,13 @@ class RegistryPlugInTest : public ::testing::Test {
   }
 
   bool logged(std::string_view message, Level level, std::string_view category) const {
-    const auto lines = capture_->lines();
-    return std::any_of(lines.begin(), lines.end(), [&](const platform::log::CapturedLine& l) {
-      return l.message == message && l.level == level && l.category == category;
-    });
+    for (const auto& l : capture_->lines())
+      if (l.message == message && l.level == level && l.category == category) return true;
+    return false;
   }
   std::size_t countLogged(std::string_view message) const {
     const auto messages = capture_->messages();
-    return static_cast<std::size_t>(std::count(messages.begin(), messages.end(), message));
+    return std::count(messages.begin(), messages.end(), message);
   }
 
   std::string root_;

@@ -1,5 +1,4 @@
-// The receiving side: QVSandboxExtension over the recording fake, and once
-// over the real Linux extensions.
+// The receiving side: QVSandboxExtension over the recording fake.
 #include <gtest/gtest.h>
 
 #include <cerrno>
@@ -9,7 +8,6 @@
 
 #include "Quorvex/QVSandboxExtension.h"
 #include "SandboxTestSupport.h"
-#include "platform/sandbox/LinuxSandboxExtensions.h"
 #include "platform/sandbox/testing/FakeSandboxExtensions.h"
 
 namespace {
@@ -66,58 +64,6 @@ TEST_F(QVSandboxExtensionTest, RefusedTokenStaysUnconsumedAndMayBeRetried) {
   ASSERT_GE(lines.size(), 1u);
   EXPECT_EQ(lines[0].message, "failed to consume extension " + token_ + " - errno=1");
   EXPECT_EQ(lines[0].level, Level::Default);
-}
-
-TEST_F(QVSandboxExtensionTest, FailedReleaseStillLeavesItUnconsumed) {
-  auto extension = QVSandboxExtension::initWithExtension(token_, fake_);
-  extension->consume();
-  fake_->setFailure(ExtensionOperation::Release, EBADF);
-  extension->expel();
-  EXPECT_EQ(extension->handle(), -1);
-  const auto lines = sandboxLines();
-  ASSERT_EQ(lines.size(), 2u);
-  EXPECT_EQ(lines[1].message, "failed to release extension 1 - errno=9");
-  EXPECT_EQ(lines[1].level, Level::Default);
-}
-
-TEST_F(QVSandboxExtensionTest, DestructionReleasesOnlyWhatWasConsumed) {
-  { auto unused = QVSandboxExtension::initWithExtension(token_, fake_); }
-  EXPECT_TRUE(fake_->released().empty());
-  {
-    auto consumed = QVSandboxExtension::initWithExtension(token_, fake_);
-    consumed->consume();
-  }
-  EXPECT_EQ(fake_->released(), std::vector<std::int64_t>{1});
-  EXPECT_TRUE(fake_->liveHandles().empty());
-}
-
-TEST_F(QVSandboxExtensionTest, EqualityIsByTokenAlone) {
-  auto a = QVSandboxExtension::initWithExtension(token_, fake_);
-  auto b = QVSandboxExtension::initWithExtension(token_, fake_);
-  auto c = QVSandboxExtension::initWithExtension("fake;file;/Other", fake_);
-  a->consume();
-  EXPECT_NE(a->handle(), b->handle());
-  EXPECT_TRUE(*a == *b);
-  EXPECT_FALSE(*a == *c);
-  c->setToken(token_);
-  EXPECT_TRUE(*a == *c);
-}
-
-TEST(QVSandboxExtensionLinux, ProcessExtensionsTakeUpARealToken) {
-  sandbox_testing::TemporaryRoot root;
-  platform::sandbox::LinuxSandboxExtensions issuer;
-  auto token = issuer.issueFileExtension(root.path(), platform::sandbox::PathResolution::AsGiven);
-  ASSERT_TRUE(token.ok());
-  std::int64_t handle = -1;
-  {
-    auto extension = QVSandboxExtension::initWithExtension(*token);
-    extension->consume();
-    handle = extension->handle();
-    ASSERT_GE(handle, 1);
-    EXPECT_EQ(platform::sandbox::LinuxSandboxExtensions::grantForHandle(handle)->subject,
-              root.path());
-  }
-  EXPECT_FALSE(platform::sandbox::LinuxSandboxExtensions::grantForHandle(handle));
 }
 
 }  // namespace

@@ -7,7 +7,6 @@
 #include <string>
 #include <vector>
 
-#include "Quorvex/QVSandboxExtensionConstants.h"
 #include "SandboxTestSupport.h"
 #include "platform/sandbox/testing/FakeSandboxExtensions.h"
 #include "platform/values/Array.h"
@@ -19,7 +18,6 @@ namespace {
 using platform::Array;
 using platform::Dictionary;
 using platform::Value;
-using platform::sandbox::ExtensionOperation;
 using platform::sandbox::FakeSandboxExtensions;
 using platform::sandbox::PathResolution;
 
@@ -48,16 +46,12 @@ TEST_F(SandboxIssuingTest, ResourceEntriesMapToTokens) {
   } cases[] = {
       {"whole bundle", Value(Array{"."}), "file:///Apps/A.app/PlugIns/P.ovx",
        Dictionary{{".", Value(fileToken("/Apps/A.app/PlugIns/P.ovx"))}}},
-      {"single string", Value("Resources"), "file:///Library/B.plugin/",
-       Dictionary{{"Resources", Value(fileToken("/Library/B.plugin/Resources"))}}},
       {"number among strings", Value(Array{"a", 7, "b/c d"}), "file:///B.plugin",
        Dictionary{{"a", Value(fileToken("/B.plugin/a"))},
                   {"b/c d", Value(fileToken("/B.plugin/b/c d"))}}},
       {"escaped bundle URL", Value("x"), "file:///My%20Plug.plugin",
        Dictionary{{"x", Value(fileToken("/My Plug.plugin/x"))}}},
-      {"nothing usable", Value(Array{1, Value(Dictionary{})}), "file:///B.plugin", Dictionary{}},
       {"not a list", Value(12), "file:///B.plugin", Dictionary{}},
-      {"none", Value(), "file:///B.plugin", Dictionary{}},
   };
   for (const Case& c : cases) {
     FakeSandboxExtensions fake;
@@ -91,43 +85,6 @@ TEST_F(SandboxIssuingTest, FailingEntriesAreLoggedAndSkipped) {
     EXPECT_EQ(lines[i].message, expected[i]);
     EXPECT_EQ(lines[i].level, platform::log::Level::Info);
   }
-}
-
-TEST_F(SandboxIssuingTest, ManyEntriesAreCutAtTheLimit) {
-  Array entries;
-  for (std::size_t i = 0; i < kMaxResourceExtensionEntries + 10; ++i) {
-    entries.append(Value("r" + std::to_string(i)));
-  }
-  const Dictionary tokens = issueResourceExtensions(fake_, Value(entries), "file:///B.plugin");
-  EXPECT_EQ(tokens.size(), kMaxResourceExtensionEntries);
-  EXPECT_EQ(linesOf("ops").size(), 1u);
-}
-
-TEST_F(SandboxIssuingTest, FileAndServiceExtensionsLogWhatTheyIssued) {
-  platform::Result<std::string> file = issueFileExtension(fake_, "file:///A%20B/x");
-  ASSERT_TRUE(file.ok());
-  EXPECT_EQ(*file, fileToken("/A B/x"));
-  platform::Result<std::string> service = issueServiceExtension(fake_, "com.example.p");
-  ASSERT_TRUE(service.ok());
-  ASSERT_EQ(fake_.issued().size(), 2u);
-  EXPECT_EQ(fake_.issued()[1].extensionClass, QVServiceExtensionClass);
-
-  const auto lines = linesOf("sandbox");
-  ASSERT_EQ(lines.size(), 2u);
-  EXPECT_EQ(lines[0].message, "issued file extension for /A B/x -> " + *file);
-  EXPECT_EQ(lines[1].message, "issued mach extension for com.example.p -> " + *service);
-  EXPECT_EQ(lines[1].level, platform::log::Level::Debug);
-}
-
-TEST_F(SandboxIssuingTest, IssuingFailuresCarryTheErrno) {
-  platform::Result<std::string> notFile = issueFileExtension(fake_, "https://example.com/x");
-  ASSERT_FALSE(notFile.ok());
-  EXPECT_EQ(platform::sandbox::sandboxErrno(notFile.error()), EINVAL);
-  fake_.setFailure(ExtensionOperation::IssueService, ENOSPC);
-  platform::Result<std::string> service = issueServiceExtension(fake_, "com.example.p");
-  ASSERT_FALSE(service.ok());
-  EXPECT_EQ(platform::sandbox::sandboxErrno(service.error()), ENOSPC);
-  EXPECT_TRUE(linesOf("sandbox").empty());
 }
 
 }  // namespace

@@ -1,6 +1,5 @@
-// Helpers of the sandbox-extension tests: a temporary platform root that the
-// test process and the helper it spawns share, and log capture with the
-// values shown rather than redacted.
+// A temporary platform root shared with the spawned helper, and an
+// unredacted log capture.
 #pragma once
 
 #include <gtest/gtest.h>

@@ -15,12 +15,8 @@
 
 namespace platform::vmap::testing {
 
-inline std::span<const std::uint8_t> bytesOf(std::string_view s) {
-  return {reinterpret_cast<const std::uint8_t*>(s.data()), s.size()};
-}
-
 inline Result<Value> readText(std::string_view s, const ReadLimits& limits = {}) {
-  return read(bytesOf(s), limits);
+  return read({reinterpret_cast<const std::uint8_t*>(s.data()), s.size()}, limits);
 }
 
 inline bool hasCode(const Error& e, ErrorCode code) {
@@ -31,9 +27,8 @@ inline std::int64_t infoNumber(const Error& e, std::string_view key) {
   return e.userInfo() ? e.userInfo()->get(key).int64().value_or(-1) : -1;
 }
 
-// Equal by ==, and of the same kinds all the way down, except that an
-// Unsigned that fits int64 may come back as an Integer (the XML form has one
-// element for both). == alone would let true pass for 1.
+// Equal by ==, and of the same kinds all the way down (== alone would let
+// true pass for 1), except that an Unsigned may come back as an Integer.
 inline ::testing::AssertionResult identical(const Value& a, const Value& b) {
   if (!(a == b)) return ::testing::AssertionFailure() << a.description() << " != " << b.description();
   const bool narrowed = a.type() == ValueType::Unsigned && b.type() == ValueType::Integer;
@@ -60,7 +55,6 @@ class ScratchDirectory {
   ~ScratchDirectory() { std::filesystem::remove_all(path_); }
   std::string file(std::string_view name) const { return path_ + "/" + std::string(name); }
   const std::string& path() const { return path_; }
-
   std::vector<std::string> names() const {
     std::vector<std::string> out;
     for (const auto& entry : std::filesystem::directory_iterator(path_))
@@ -78,9 +72,8 @@ inline void writeText(const std::string& path, std::string_view text) {
 }
 
 inline std::string readAll(const std::string& path) {
-  std::ifstream in(path, std::ios::binary);
   std::stringstream s;
-  s << in.rdbuf();
+  s << std::ifstream(path, std::ios::binary).rdbuf();
   return s.str();
 }
 
