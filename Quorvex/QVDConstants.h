@@ -79,3 +79,8 @@ inline constexpr std::string_view QVUserElectionAttribute = "XOUserElection";
 inline constexpr std::string_view QVUUIDAttribute = "com.corvane.uuid";
 inline constexpr std::string_view QVProtocolAttribute = "XOExtensionPointName";
 inline constexpr std::string_view QVAnnotationsFormKey = "annotations";
+// The entries of an annotation that a client may set; the daemon drops any
+// other. The election is an integer (1 elected, 0 or absent undecided, any
+// other value the user's own decision); the extension a dictionary.
+inline constexpr std::string_view QVAnnotationElectionKey = "election";
+inline constexpr std::string_view QVAnnotationExtensionKey = "extension";

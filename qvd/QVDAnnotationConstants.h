@@ -1,5 +1,4 @@
-// The vocabulary of annotations and of the annotation file: the entries the
-// daemon reads in an annotation, the file's two root keys and its version,
+// The vocabulary of the annotation file: its two root keys and its version,
 // and the error a read reports for a file that is not there. The texts are
 // stored on disk and handed to clients, so they never change.
 //
@@ -9,9 +8,9 @@
 #include <cstdint>
 #include <string_view>
 
-// Entries of an annotation.
-inline constexpr std::string_view QVAnnotationElectionKey = "election";    // integer
-inline constexpr std::string_view QVAnnotationExtensionKey = "extension";  // dictionary
+// The entries of an annotation, which clients set too, are in
+// Quorvex/QVDConstants.h.
+#include "Quorvex/QVDConstants.h"
 
 // Root entries of the annotation file.
 inline constexpr std::string_view QVVersionAnnotationsKey = "version";

@@ -151,11 +151,7 @@ void QVDServer::stop() {
                        hold->token());
     }
     holds_.clear();
-    if (platform::Status posted = platform_.notifications->post(QVNotifyAnnotationChange);
-        !posted.ok()) {
-      QVLogOps().error("cannot post %{public}s: %@", std::string(QVNotifyAnnotationChange),
-                       posted.error());
-    }
+    notifyAnnotationChange();
   });
 }
 

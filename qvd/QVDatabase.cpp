@@ -16,16 +16,18 @@ QVDatabase::~QVDatabase() = default;
 
 platform::Status QVDatabase::initDatabase(std::optional<std::string> databasePath,
                                           const Platform& services) {
-  if (!services.registry || !services.locale || !services.extensions) {
+  if (!services.registry || !services.locale || !services.extensions ||
+      !services.notifications) {
     return QVErrorWithCodeMessage(QVErrorInvalidRequest,
-                                  "the plug-in database needs the registration, locale and "
-                                  "sandbox extension services");
+                                  "the plug-in database needs the registration, locale, "
+                                  "notification and sandbox extension services");
   }
   databasePath_ = databasePath;
   auto store = QVDAnnotationStore::initWithDatabase(std::move(databasePath), services.containers);
   if (!store.ok()) return store.error();
   annotations_ = std::move(store).value();
   registry_ = services.registry;
+  notifications_ = services.notifications;
   plugInServices_ = {services.registry, services.locale, services.extensions};
 
   // The observers outlive nothing they borrow: both hold the cache weakly.

@@ -27,6 +27,7 @@
 #include "platform/dispatch/SerialQueue.h"
 #include "platform/holvane/RegistrationRecord.h"
 #include "platform/holvane/Registry.h"
+#include "platform/notify/NotificationCenter.h"
 #include "platform/notify/ObservationHandle.h"
 #include "platform/values/Dictionary.h"
 #include "platform/values/Result.h"
@@ -98,6 +99,20 @@ class QVDatabase {
   std::optional<std::vector<std::shared_ptr<QVDPlugIn>>> plugInsWithinApplication(
       std::string_view url);
 
+  // ---- Annotations (QVDatabaseAnnotations.cpp) ----
+
+  // The plug-in's stored annotation, or none. REQUIRES: not on syncQueue().
+  std::optional<platform::Dictionary> annotationForPlugIn(const QVDPlugIn& plugIn) const;
+  // Merges `annotation` into the stored one (none removes it) and saves
+  // before returning, so concurrent changes are applied and written one at a
+  // time. A failed save is logged by the store, not reported.
+  // REQUIRES: not on syncQueue().
+  void setAnnotationForPlugIn(std::optional<platform::Dictionary> annotation,
+                              const QVDPlugIn& plugIn);
+  // Tells other processes that annotations (or holds) changed. A failed
+  // post is logged.
+  void notifyAnnotationChange() const;
+
   // ---- Settings ----
 
   // A creation that finds more than this many cached plug-ins empties the
@@ -139,6 +154,7 @@ class QVDatabase {
   // after the database is gone finds nothing to change.
   const std::shared_ptr<QVDPlugInCache> cache_;
   std::shared_ptr<platform::holvane::Registry> registry_;
+  std::shared_ptr<platform::notify::NotificationCenter> notifications_;
   QVDPlugIn::Services plugInServices_;
   platform::notify::ObservationHandle regionObserver_;
 };

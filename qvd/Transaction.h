@@ -69,6 +69,21 @@ class Transaction : public std::enable_shared_from_this<Transaction> {
   // finish the transaction on success.
   bool processUuidList(const PlugInCallback& callback);
 
+  // ---- Annotations (TransactionAnnotations.cpp) ----
+
+  // Whether a plug-in without an annotation is shown as elected: never.
+  bool pluginShouldBeAutoEnabled(const QVDPlugIn& plugIn) const;
+  // Sets form["annotations"] to the plug-in's annotation, or to an empty
+  // dictionary when it has none.
+  void addAnnotationForPlugIn(const QVDPlugIn& plugIn, platform::Dictionary& form) const;
+
+  // ---- Find (TransactionFind.cpp) ----
+
+  // The plug-in with the UUID of a wire UUID value, or none.
+  std::shared_ptr<QVDPlugIn> findPlugInByUUID(const platform::Value& wireUuid) const;
+  // The plug-in whose bundle the URL text of a wire string names, or none.
+  std::shared_ptr<QVDPlugIn> findPlugInByPathURL(const platform::Value& wireUrl) const;
+
   // Sends the reply.
   void done();
   // Adds "errorcode" and "error" to the reply, then done().

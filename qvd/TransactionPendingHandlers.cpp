@@ -15,9 +15,6 @@ void Transaction::bulkPlugIns() { notYetServed(); }
 void Transaction::matchPlugIns() { notYetServed(); }
 void Transaction::readyPlugIns() { notYetServed(); }
 void Transaction::accessPlugIns() { notYetServed(); }
-void Transaction::annotatePlugIns() { notYetServed(); }
-void Transaction::bulkAnnotatePlugIns() { notYetServed(); }
 void Transaction::lockDownPlugIns() { notYetServed(); }
-void Transaction::findPlugIn() { notYetServed(); }
 
 }  // namespace qvd

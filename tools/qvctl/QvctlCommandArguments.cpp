@@ -137,7 +137,7 @@ Status parseCommandArguments(Invocation& invocation, std::span<const std::string
       }
       if (election) {
         if (*election != "0" && *election != "1") return usageError("--election: expected 0 or 1");
-        invocation.annotations.set(QVUserElectionAttribute, Value(*election == "1" ? 1 : 0));
+        invocation.annotations.set(QVAnnotationElectionKey, Value(*election == "1" ? 1 : 0));
       } else {
         Result<Dictionary> annotations = jsonObjectOption("--annotations", *json);
         if (!annotations.ok()) return annotations.error();
