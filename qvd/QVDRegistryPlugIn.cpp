@@ -10,6 +10,7 @@
 #include "Quorvex/QVFileURL.h"
 #include "Quorvex/QVLog.h"
 #include "Quorvex/QVPlugInConstants.h"
+#include "platform/log/SignpostInterval.h"
 #include "platform/root/Root.h"
 
 namespace qvd {
@@ -49,6 +50,7 @@ std::optional<PlugInRecord> recordOrNone(const platform::Result<std::optional<Pl
 
 std::shared_ptr<QVDPlugIn> QVDPlugIn::initWithHVData(const PlugInRecord& record,
                                                      Services services) {
+  const platform::log::SignpostInterval interval(QVLogOps(), "QVHVInitialization");
   if (record.path.empty()) return nullptr;
   const std::string url = QVFileURLFromPath(record.path);
   std::shared_ptr<QVDPlugIn> plugIn(new QVDPlugIn(std::move(services)));

@@ -12,6 +12,7 @@
 
 #include "LogTestSupport.h"
 #include "platform/log/LogCaptureForTesting.h"
+#include "platform/log/SignpostInterval.h"
 #include "platform/log/LoggerRegistry.h"
 
 namespace platform::log {
@@ -60,6 +61,24 @@ TEST_F(LogLogger, DisabledLevelBuildsNoMessage) {
   ASSERT_EQ(lines.size(), 3u);
   EXPECT_EQ(lines[0].message, "n counted");
   EXPECT_EQ(lines[1].level, Level::Fault);
+}
+
+// An interval opened while debug is off stays silent even if debug comes on
+// before it closes: no end line without its begin.
+TEST_F(LogLogger, SignpostIntervalsLogBeginAndEndOnlyWhenDebugIsOn) {
+  const Logger& l = logger(kDaemon, "signposts");
+  LogCaptureForTesting capture;
+  {
+    SignpostInterval quiet(l, "Quiet");
+    LoggerRegistry::shared().applyFilterForTesting("signposts=debug");
+  }
+  EXPECT_EQ(capture.size(), 0u);
+  { SignpostInterval traced(l, "Traced"); }
+  std::vector<std::string> messages = capture.messages();
+  ASSERT_EQ(messages.size(), 2u);
+  EXPECT_EQ(messages[0], "signpost begin Traced");
+  EXPECT_EQ(messages[1].rfind("signpost end Traced after ", 0), 0u) << messages[1];
+  EXPECT_EQ(messages[1].substr(messages[1].size() - 3), " us");
 }
 
 TEST_F(LogLogger, LinesAreRedactedUnlessQvLogPrivateIsOne) {
