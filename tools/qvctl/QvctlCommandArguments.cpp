@@ -68,15 +68,18 @@ Status parseCommandArguments(Invocation& invocation, std::span<const std::string
       return platform::okStatus();
     }
     case Command::Match: {
-      Result<Scanned> s = scan(args, {"--flags", "--rules"}, {"--sync"});
+      Result<Scanned> s = scan(args, {"--flags", "--rules", "--rules-file"}, {"--sync"});
       if (!s.ok()) return s.error();
       if (Status f = syncAndFlags(s.value(), invocation); !f.ok()) return f;
       // The client library sends "match" synchronously when this bit is set.
       if (invocation.sending == QVDSending::Synchronous) invocation.flags |= QVDiscoverSynchronous;
-      if (auto json = s.value().single("--rules")) {
-        if (!s.value().operands.empty())
-          return usageError("give --rules or KEY=PATTERN rules, not both");
-        Result<Dictionary> rules = jsonObjectOption("--rules", *json);
+      auto json = s.value().single("--rules");
+      auto file = s.value().single("--rules-file");
+      if (json || file) {
+        if (!s.value().operands.empty() || (json && file))
+          return usageError("give one of --rules, --rules-file and KEY=PATTERN rules");
+        Result<Dictionary> rules = json ? jsonObjectOption("--rules", *json)
+                                        : dictionaryFileOption("--rules-file", std::string(*file));
         if (!rules.ok()) return rules.error();
         invocation.rules = std::move(rules).value();
       }

@@ -16,13 +16,14 @@ constexpr std::array kCommands{
                 "send bulk registration options (FLAGS: a number, default 0; none is supported yet)",
                 "Example: qvctl bulk 0\n"},
     CommandInfo{"match", Command::Match,
-                "match [--flags N] [--sync] [KEY=PATTERN... | --rules JSON]",
+                "match [--flags N] [--sync] [KEY=PATTERN... | --rules JSON | --rules-file FILE]",
                 "find the plug-ins whose attributes match the rules",
-                "  --flags N      discovery flags: 0x1 keep versions, 0x4 keep duplicates,\n"
-                "                 0x8 system only, 0x200 all\n"
-                "  --sync         wait for the answer inside the request (adds 0x400)\n"
-                "  KEY=PATTERN    one rule per argument, the pattern as text\n"
-                "  --rules JSON   the rules as a JSON object instead\n"
+                "  --flags N          discovery flags: 0x1 keep versions, 0x4 keep\n"
+                "                     duplicates, 0x8 system only, 0x200 all\n"
+                "  --sync             wait for the answer inside the request (adds 0x400)\n"
+                "  KEY=PATTERN        one rule per argument, the pattern as text\n"
+                "  --rules JSON       the rules as a JSON object instead\n"
+                "  --rules-file FILE  the rules from a vmap or JSON file instead\n"
                 "Example: qvctl match XOExtensionPointName=com.corvane.share\n"},
     CommandInfo{"find", Command::Find, "find UUID|PATH",
                 "show the plug-in with this UUID, or at this path (or file:// URL)",

@@ -1,7 +1,11 @@
 #include "tools/qvctl/QvctlOperands.h"
 
 #include <algorithm>
+#include <filesystem>
+#include <fstream>
+#include <iterator>
 
+#include "platform/vmap/Reader.h"
 #include "tools/qvctl/Qvctl.h"
 #include "tools/qvctl/QvctlJson.h"
 
@@ -107,6 +111,24 @@ Result<Dictionary> jsonObjectOption(std::string_view name, std::string_view text
     return usageError(std::string(name) + ": expected a JSON object");
   }
   return *value.value().dictionary();
+}
+
+Result<Dictionary> dictionaryFileOption(std::string_view name, const std::string& path) {
+  // A vmap document (either form) first; anything else is read as JSON.
+  constexpr std::uintmax_t kMaxBytes = 1 << 20;
+  std::error_code error;
+  const std::uintmax_t size = std::filesystem::file_size(path, error);
+  if (error) return usageError(std::string(name) + ": " + path + ": " + error.message());
+  if (size > kMaxBytes) return usageError(std::string(name) + ": " + path + ": larger than 1 MiB");
+  if (Result<Value> vmap = platform::vmap::readFile(path); vmap.ok()) {
+    if (vmap.value().dictionary() == nullptr) {
+      return usageError(std::string(name) + ": " + path + ": expected a dictionary");
+    }
+    return *vmap.value().dictionary();
+  }
+  std::ifstream in(path, std::ios::binary);
+  std::string text((std::istreambuf_iterator<char>(in)), std::istreambuf_iterator<char>());
+  return jsonObjectOption(std::string(name) + " " + path, text);
 }
 
 Result<std::vector<std::string>> absolutePaths(const std::vector<std::string_view>& operands,

@@ -49,6 +49,10 @@ platform::Result<platform::Uuid> uuidOperand(std::string_view text);
 // "KEY=VALUE" with a non-empty key.
 platform::Result<std::pair<std::string, std::string>> keyValue(std::string_view what,
                                                                std::string_view text);
+// The dictionary in the file at `path`: a vmap document, else JSON text
+// (at most 1 MiB). Refusals are usage errors naming the option and file.
+platform::Result<platform::Dictionary> dictionaryFileOption(std::string_view name,
+                                                            const std::string& path);
 platform::Result<platform::Dictionary> jsonObjectOption(std::string_view name,
                                                         std::string_view text);
 platform::Result<std::vector<std::string>> absolutePaths(

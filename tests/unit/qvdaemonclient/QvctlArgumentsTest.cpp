@@ -2,6 +2,7 @@
 // message of each refused one.
 #include <gtest/gtest.h>
 
+#include <fstream>
 #include <functional>
 
 #include "Quorvex/QVDConstants.h"
@@ -98,7 +99,10 @@ TEST(QvctlArguments, RefusedCommandLinesSayWhy) {
       {{"bulk", "1", "2"}, "unexpected argument 2"},
       {{"match", "--flags", "-1"}, "--flags: not a number: -1"},
       {{"match", "--rules", "[1]"}, "--rules: expected a JSON object"},
-      {{"match", "--rules", "{}", "K=V"}, "give --rules or KEY=PATTERN rules, not both"},
+      {{"match", "--rules", "{}", "K=V"}, "give one of --rules, --rules-file and KEY=PATTERN rules"},
+      {{"match", "--rules", "{}", "--rules-file", "/r"},
+       "give one of --rules, --rules-file and KEY=PATTERN rules"},
+      {{"match", "--rules-file", "/nonexistent/rules.json"}, "--rules-file: /nonexistent/rules.json: "},
       {{"ready", uuidEmptyPath}, "empty path"},
       {{"ready", "--env", "NOVALUE", kU1}, "--env: expected KEY=VALUE, got NOVALUE"},
       {{"access", "--env", "A=B", kU1}, "unknown option --env"},
@@ -115,6 +119,29 @@ TEST(QvctlArguments, RefusedCommandLinesSayWhy) {
     EXPECT_EQ(parsed.error().domain(), qvctl::kUsageErrorDomain);
     EXPECT_EQ(parsed.error().description().rfind(c.message, 0), 0u) << parsed.error().description();
   }
+}
+
+// A rules file may be a vmap document or JSON; whatever it holds must be a
+// dictionary.
+TEST(QvctlArguments, RulesFromAFile) {
+  const std::string dir = ::testing::TempDir();
+  const std::string vmap = dir + "qvctl-rules.vmap";
+  const std::string json = dir + "qvctl-rules.json";
+  const std::string list = dir + "qvctl-rules-list.json";
+  std::ofstream(vmap) << "<?xml version=\"1.0\" encoding=\"UTF-8\"?>\n<vmap version=\"1.0\">"
+                         "<dict><key>XOExtensionVersion</key><string>&gt;=2</string></dict></vmap>\n";
+  std::ofstream(json) << R"({"XOExtensionPointName": ["a", "b"], "Flag": true})";
+  std::ofstream(list) << "[1, 2]";
+  auto fromVmap = parse({"match", "--rules-file", vmap});
+  ASSERT_TRUE(fromVmap.ok()) << fromVmap.error().description();
+  EXPECT_EQ(Value(fromVmap.value().rules), Value(Dictionary{{"XOExtensionVersion", ">=2"}}));
+  auto fromJson = parse({"match", "--rules-file", json});
+  ASSERT_TRUE(fromJson.ok()) << fromJson.error().description();
+  EXPECT_EQ(Value(fromJson.value().rules),
+            Value(Dictionary{{"XOExtensionPointName", Array{"a", "b"}}, {"Flag", true}}));
+  auto fromList = parse({"match", "--rules-file", list});
+  ASSERT_FALSE(fromList.ok());
+  EXPECT_NE(fromList.error().description().find("expected a JSON object"), std::string::npos);
 }
 
 }  // namespace
