@@ -142,6 +142,21 @@ TEST_F(DatabaseTest, AutoElectionOnCreation) {
     auto annotation = db_.annotationStore().annotationForIdentifier("com.example." + name);
     EXPECT_EQ(annotation ? annotation->get(QVAnnotationElectionKey) : Value(), cases[i].second) << i;
   }
+  // The user's 0 lasts only until the record is built again: after a purge
+  // it is raised to 1 once more.
+  const PlugInRecord again = put(record("again", {{K(QVAutoElectEntitlement), true}}));
+  ASSERT_NE(db_.plugInForProxy(again), nullptr);
+  annotate("com.example.again", 0);
+  EXPECT_NE(db_.plugInForProxy(again), nullptr) << "a cache hit elects nothing";
+  EXPECT_EQ(db_.annotationStore().annotationForIdentifier("com.example.again")->get(
+                QVAnnotationElectionKey),
+            Value(0));
+  fakes_.locale->setLocale("fr");
+  EXPECT_TRUE(eventually([&] { return db_.cacheCount() == 0; }));
+  ASSERT_NE(db_.plugInForProxy(again), nullptr);
+  EXPECT_EQ(db_.annotationStore().annotationForIdentifier("com.example.again")->get(
+                QVAnnotationElectionKey),
+            Value(1));
 }
 
 TEST_F(DatabaseTest, ElectionFilterReadsAnnotations) {
