@@ -5,6 +5,7 @@
 #include <sys/stat.h>
 #include <time.h>
 
+#include <algorithm>
 #include <type_traits>
 
 #include "platform/dispatch/ScopedBlockingCall.h"
@@ -57,6 +58,12 @@ void moveAside(const std::string& path) {
 
 }  // namespace
 
+struct LinuxRegistry::Batch {
+  internal::Transaction transaction;
+  std::size_t changes = 0;
+  std::vector<PlugInRecord> installed;  // told to the observers at commit
+};
+
 template <typename Work>
 auto LinuxRegistry::onQueue(Work&& work) const -> decltype(work()) {
   using Answer = decltype(work());
@@ -78,6 +85,7 @@ LinuxRegistry::LinuxRegistry(RegistryLocations locations, std::shared_ptr<const 
       entitlements_(std::move(entitlements)),
       builder_(locations_, *sdks_, *entitlements_),
       scan_(locations_, limits),
+      changesPerTransaction_(std::max<std::size_t>(1, limits.changesPerTransaction)),
       queue_(dispatch::SerialQueue::create("com.corvane.holvane")) {}
 
 LinuxRegistry::~LinuxRegistry() {
@@ -130,6 +138,11 @@ Result<LinuxRegistry::StoreFile> LinuxRegistry::openStore() {
 
 Status LinuxRegistry::storeChange(const std::function<Status()>& change) {
   QV_ASSERT_ON_QUEUE(queue_);
+  if (batch_) {
+    if (Status changed = change(); !changed.ok()) return changed;
+    ++batch_->changes;
+    return okStatus();
+  }
   Result<internal::Transaction> transaction = store_->begin();
   if (!transaction.ok()) return transaction.error();
   if (Status changed = change(); !changed.ok()) return changed;
@@ -179,8 +192,42 @@ Result<LinuxRegistry::Registered> LinuxRegistry::registerOnQueue(std::string_vie
     return stored.error();
   }
   holvaneLog().info("registered %{public}@ as %{public}@", record.path, record.identifier);
-  for (const RecordObserver& observer : installObservers_) observer(record);
+  noteInstalled(record);
   return Registered{std::move(record), Outcome::Stored};
+}
+
+void LinuxRegistry::noteInstalled(const PlugInRecord& record) {
+  QV_ASSERT_ON_QUEUE(queue_);
+  if (batch_) {
+    batch_->installed.push_back(record);
+    return;
+  }
+  for (const RecordObserver& observer : installObservers_) observer(record);
+}
+
+Status LinuxRegistry::beginBatch() {
+  QV_ASSERT_ON_QUEUE(queue_);
+  Result<internal::Transaction> transaction = store_->begin();
+  if (!transaction.ok()) return transaction.error();
+  batch_.reset(new Batch{std::move(transaction).value(), 0, {}});
+  return okStatus();
+}
+
+Status LinuxRegistry::commitBatch() {
+  QV_ASSERT_ON_QUEUE(queue_);
+  const std::unique_ptr<Batch> batch = std::move(batch_);
+  if (batch->changes == 0) return okStatus();  // rolled back: nothing to store
+  const Uuid next = Uuid::generate();
+  if (Status set = store_->setGeneration(next); !set.ok()) return set;
+  if (Status committed = batch->transaction.commit(); !committed.ok()) return committed;
+  {
+    std::lock_guard<std::mutex> lock(generationMu_);
+    generation_ = next;
+  }
+  for (const PlugInRecord& record : batch->installed) {
+    for (const RecordObserver& observer : installObservers_) observer(record);
+  }
+  return okStatus();
 }
 
 Status LinuxRegistry::removeOnQueue(const PlugInRecord& record) {
@@ -287,12 +334,22 @@ Result<ScanSummary> LinuxRegistry::scanOnQueue() {
   for (const Error& problem : candidates.problems) {
     holvaneLog().error("start-up registration skips a directory: %{public}@", problem);
   }
+  // One transaction per plug-in would cost a commit each; a pass over
+  // thousands of bundles stores them in batches instead. A failure rolls
+  // back only the open batch.
+  if (Status begun = beginBatch(); !begun.ok()) return begun.error();
+  auto batchFull = [&]() -> Status {
+    if (batch_->changes < changesPerTransaction_) return okStatus();
+    if (Status committed = commitBatch(); !committed.ok()) return committed;
+    return beginBatch();
+  };
   for (const std::string& path : candidates.plugInPaths) {
     Result<Registered> registered = registerOnQueue(path);
     if (!registered.ok()) {
       // A refusal is the bundle's fault and is logged; a storage failure
       // would fail every later bundle too.
       if (!isRegistryError(registered.error(), RegistryErrorCode::Refused)) {
+        batch_.reset();
         return registered.error();
       }
       ++summary.refused;
@@ -301,16 +358,29 @@ Result<ScanSummary> LinuxRegistry::scanOnQueue() {
     } else {
       ++summary.unchanged;
     }
+    if (Status next = batchFull(); !next.ok()) {
+      batch_.reset();
+      return next.error();
+    }
   }
   Result<std::vector<PlugInRecord>> stored = store_->allPlugIns();
-  if (!stored.ok()) return stored.error();
+  if (!stored.ok()) {
+    batch_.reset();
+    return stored.error();
+  }
   for (const PlugInRecord& record : *stored) {
     struct stat status {};
     if (::stat((record.path + "/Info.vmap").c_str(), &status) == 0) continue;
     if (errno != ENOENT && errno != ENOTDIR) continue;  // not known to be gone
-    if (Status removed = removeOnQueue(record); !removed.ok()) return removed.error();
+    Status removed = removeOnQueue(record);
+    if (removed.ok()) removed = batchFull();
+    if (!removed.ok()) {
+      batch_.reset();
+      return removed.error();
+    }
     ++summary.dropped;
   }
+  if (Status committed = commitBatch(); !committed.ok()) return committed.error();
   holvaneLog().notice("registration pass: %d stored, %d unchanged, %d refused, %d dropped",
                       summary.registered, summary.unchanged, summary.refused, summary.dropped);
   return summary;

@@ -89,8 +89,17 @@ class LinuxRegistry final : public Registry {
   // REQUIRES: on queue_.
   Result<Registered> registerOnQueue(std::string_view bundlePath);
   Status removeOnQueue(const PlugInRecord& record);
-  // Runs `change` and stores a new generation in one transaction.
+  // Runs `change` and stores a new generation in one transaction; inside a
+  // batch, the batch's transaction and generation serve instead.
   Status storeChange(const std::function<Status()>& change);
+  // Tells the install observers of `record`: now, or when the open batch
+  // commits, so that no observer hears of a change that is not stored.
+  void noteInstalled(const PlugInRecord& record);
+  // A batch groups the changes of a registration pass into transactions of
+  // up to ScanLimits::changesPerTransaction changes, each with one new
+  // generation.
+  Status beginBatch();
+  Status commitBatch();
   Result<ScanSummary> scanOnQueue();
 
   const RegistryLocations locations_;
@@ -98,10 +107,14 @@ class LinuxRegistry final : public Registry {
   const std::shared_ptr<const codesign::EntitlementStore> entitlements_;
   const internal::RecordBuilder builder_;
   const RegistryScan scan_;
+  const std::size_t changesPerTransaction_;
   const std::shared_ptr<dispatch::SerialQueue> queue_;
+
+  struct Batch;  // the open transaction and what it holds
 
   // Confined to queue_.
   std::unique_ptr<internal::RecordStore> store_;
+  std::unique_ptr<Batch> batch_;
   std::vector<RecordObserver> installObservers_;
   std::vector<RecordObserver> uninstallObservers_;
 

@@ -20,6 +20,10 @@ struct ScanLimits {
   std::size_t maxEntriesPerDirectory = 100'000;
   // In all: bundles beyond this are left for a later pass (and noted).
   std::size_t maxCandidates = 100'000;
+  // Changes stored per transaction during a pass: enough that commits do
+  // not dominate a pass over thousands of bundles, few enough that a
+  // failure rolls back little.
+  std::size_t changesPerTransaction = 500;
 };
 
 struct ScanCandidates {

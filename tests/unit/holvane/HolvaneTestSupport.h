@@ -102,13 +102,14 @@ struct RegistryUnderTest {
 };
 
 inline RegistryUnderTest openRegistry(const SystemRoot& root,
-                                      StartupScan scan = StartupScan::Skip) {
+                                      StartupScan scan = StartupScan::Skip,
+                                      ScanLimits limits = {}) {
   RegistryUnderTest made;
   made.sdks = std::make_shared<LinuxSdkRegistry>(root / "System/Library/ExtensionPoints");
   made.entitlements = std::make_shared<codesign::LinuxEntitlementStore>(
       root / "etc/quorvex/entitlements", ::geteuid());
   Result<std::shared_ptr<LinuxRegistry>> opened =
-      LinuxRegistry::open(root.locations(), made.sdks, made.entitlements, scan);
+      LinuxRegistry::open(root.locations(), made.sdks, made.entitlements, scan, limits);
   EXPECT_TRUE(opened.ok()) << (opened.ok() ? "" : opened.error().description());
   if (opened.ok()) made.registry = *opened;
   return made;

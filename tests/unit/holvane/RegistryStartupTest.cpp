@@ -5,6 +5,8 @@
 #include <algorithm>
 #include <filesystem>
 
+#include "platform/vmap/Writer.h"
+
 #include "platform/holvane/RegistryError.h"
 #include "platform/log/LogCaptureForTesting.h"
 #include "tests/unit/holvane/HolvaneTestSupport.h"
@@ -121,6 +123,41 @@ TEST_F(RegistryStartupTest, DamagedDatabaseIsMovedAsideAndRebuilt) {
   // And it works as usual afterwards.
   ASSERT_TRUE(opened.registry->unregisterPlugIn(app_ + "/PlugIns/Share.ovx").ok());
   EXPECT_TRUE(opened.registry->registerPlugIn(app_ + "/PlugIns/Share.ovx").ok());
+}
+
+// A pass over more bundles than one transaction takes: every bundle is
+// stored once, each install observer hears of each exactly once, and a
+// restart finds them all.
+TEST_F(RegistryStartupTest, LargePassIsStoredInBatches) {
+  constexpr int kExtra = 40;
+  ScanLimits limits;
+  limits.changesPerTransaction = 7;
+  for (int i = 0; i < kExtra; ++i) {
+    Result<std::string> text = vmap::write(
+        plugInInfo("com.example.extra" + std::to_string(i), "com.example.many"), vmap::Format::Xml);
+    ASSERT_TRUE(text.ok());
+    writeText(root_ / ("System/Library/PlugIns/Extra" + std::to_string(i) + ".ovx/Info.vmap"),
+              *text);
+  }
+  Uuid generation;
+  {
+    RegistryUnderTest opened = openRegistry(root_, StartupScan::Skip, limits);
+    std::vector<std::string> installed;
+    opened.registry->addInstallObserver(
+        [&](const PlugInRecord& record) { installed.push_back(record.identifier); });
+    const Uuid before = opened.registry->generation();
+    Result<ScanSummary> summary = opened.registry->scanInstalledBundles();
+    ASSERT_TRUE(summary.ok());
+    EXPECT_EQ(summary->registered, kExtra + 3u);
+    EXPECT_EQ(installed.size(), kExtra + 3u);
+    std::sort(installed.begin(), installed.end());
+    EXPECT_EQ(std::adjacent_find(installed.begin(), installed.end()), installed.end());
+    EXPECT_NE(opened.registry->generation(), before);
+    generation = opened.registry->generation();
+  }
+  RegistryUnderTest again = openRegistry(root_, StartupScan::Skip);
+  EXPECT_EQ(again.registry->allPlugIns()->size(), kExtra + 3u);
+  EXPECT_EQ(again.registry->generation(), generation);
 }
 
 }  // namespace
