@@ -88,7 +88,12 @@ Result<std::shared_ptr<Connection>> QVDaemonClient::connectLocked() {
   // Connecting holds the lock: concurrent first requests share one
   // connection instead of racing to make several. A local connect() is
   // quick unless the daemon's backlog is full.
-  Result<std::shared_ptr<Connection>> made = Connection::connectToService(serviceName_);
+  // Replies carry whole plug-in forms, a few hundred values each, so a
+  // match answering thousands of plug-ins holds far more values than any
+  // request may. The body stays within the wire's byte limit either way.
+  platform::mbx::ConnectionLimits limits;
+  limits.frame.maxItems = kMaxReplyItems;
+  Result<std::shared_ptr<Connection>> made = Connection::connectToService(serviceName_, limits);
   if (!made.ok()) return made.error();
   std::shared_ptr<Connection> connection = made.value();
   // Weak references only: the connection holds its handler until it ends,

@@ -137,6 +137,8 @@ class QVDaemonClient : public std::enable_shared_from_this<QVDaemonClient> {
   platform::Value convertFromMBX(const platform::Value& wireValue) const;
 
   std::uint64_t protocolVersion() const { return protocolVersion_.load(); }
+  // Values one reply may hold (every key, value and element counts).
+  static constexpr std::size_t kMaxReplyItems = std::size_t{1} << 21;
   const std::string& serviceName() const { return serviceName_; }
   // "qvd_client".
   const std::shared_ptr<platform::dispatch::SerialQueue>& replyQueue() const { return replyQueue_; }

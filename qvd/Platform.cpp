@@ -5,10 +5,13 @@
 #include "platform/holvane/LinuxRegistry.h"
 #include "platform/holvane/LinuxSdkRegistry.h"
 #include "platform/locale/LinuxLocaleService.h"
+#include "platform/lumend/LinuxServiceManager.h"
 #include "platform/notify/LinuxNotificationCenter.h"
 #include "platform/prefs/LinuxPreferenceStore.h"
 #include "platform/sandbox/LinuxSandboxCheck.h"
 #include "platform/sandbox/LinuxSandboxExtensions.h"
+#include "platform/types/LinuxTypeRegistry.h"
+#include "platform/vouchd/LinuxAssertionService.h"
 
 namespace qvd {
 
@@ -32,6 +35,10 @@ platform::Result<Platform> Platform::linuxPlatform() {
   services.registry = std::move(registry).value();
   services.locale = std::make_shared<platform::locale::LinuxLocaleService>();
   services.extensions = std::make_shared<platform::sandbox::LinuxSandboxExtensions>();
+  // Read once here: the declarations ship with the system volume.
+  services.types = std::make_shared<platform::types::LinuxTypeRegistry>();
+  services.serviceManager = std::make_shared<platform::lumend::LinuxServiceManager>();
+  services.assertions = std::make_shared<platform::vouchd::LinuxAssertionService>();
   return services;
 }
 

@@ -12,11 +12,14 @@
 #include "platform/container/ContainerManager.h"
 #include "platform/holvane/Registry.h"
 #include "platform/locale/LocaleService.h"
+#include "platform/lumend/ServiceManager.h"
 #include "platform/notify/NotificationCenter.h"
 #include "platform/prefs/PreferenceStore.h"
 #include "platform/sandbox/SandboxCheck.h"
 #include "platform/sandbox/SandboxExtensions.h"
+#include "platform/types/TypeRegistry.h"
 #include "platform/values/Result.h"
+#include "platform/vouchd/AssertionService.h"
 
 namespace qvd {
 
@@ -30,6 +33,13 @@ struct Platform {
   std::shared_ptr<platform::holvane::Registry> registry;
   std::shared_ptr<platform::locale::LocaleService> locale;
   std::shared_ptr<platform::sandbox::SandboxExtensions> extensions;
+  // Type conformance and activation rules, for match rules.
+  std::shared_ptr<const platform::types::TypeRegistry> types;
+  // The service manager (lumend): ends the processes of held and
+  // uninstalled plug-ins.
+  std::shared_ptr<platform::lumend::ServiceManager> serviceManager;
+  // The process-assertion service (vouchd): which plug-ins are busy.
+  std::shared_ptr<const platform::vouchd::AssertionService> assertions;
 
   // The Linux implementations, all under the platform root; the registry
   // has registered what is installed before this returns. Fails when this
@@ -40,7 +50,7 @@ struct Platform {
   // True when every service is present.
   bool complete() const {
     return entitlements && sandbox && preferences && notifications && containers && registry &&
-           locale && extensions;
+           locale && extensions && types && serviceManager && assertions;
   }
 };
 

@@ -26,12 +26,16 @@
 #include "platform/holvane/Registry.h"
 #include "platform/locale/LocaleService.h"
 #include "platform/sandbox/SandboxExtensions.h"
+#include "platform/types/TypeRegistry.h"
 #include "platform/values/Error.h"
 #include "platform/values/Uuid.h"
 #include "platform/values/Value.h"
+#include "platform/vouchd/AssertionService.h"
 #include "qvd/QVDAnnotated.h"
 
 namespace qvd {
+
+class QVDMbxClient;
 
 // The entitlement whose string value names the plug-in whose annotations
 // this one takes over.
@@ -50,6 +54,9 @@ class QVDPlugIn final : public QVPlugInCore, public QVDAnnotated {
     std::shared_ptr<const platform::holvane::Registry> registry;
     std::shared_ptr<const platform::locale::LocaleService> locale;
     std::shared_ptr<const platform::sandbox::SandboxExtensions> extensions;
+    // Type conformance and activation rules for match rules. May be null:
+    // then type operators and dictionary patterns match nothing.
+    std::shared_ptr<const platform::types::TypeRegistry> types = nullptr;
   };
 
   // ---- Construction and validation (QVDRegistryPlugIn.cpp) ----
@@ -57,7 +64,7 @@ class QVDPlugIn final : public QVPlugInCore, public QVDAnnotated {
   // The plug-in of `record`, or null when the record has no location or
   // identifier, or the plug-in fails `diagnose` (logged). Localized names
   // are not fetched here.
-  // REQUIRES: every service in `services` is non-null.
+  // REQUIRES: every service in `services` but `types` is non-null.
   static std::shared_ptr<QVDPlugIn> initWithHVData(const platform::holvane::PlugInRecord& record,
                                                    Services services);
 
@@ -120,6 +127,52 @@ class QVDPlugIn final : public QVPlugInCore, public QVDAnnotated {
       const platform::holvane::PlugInRecord& record, const platform::Dictionary& qvdict) const;
   // `info` without its entries whose key begins with "DT".
   static platform::Dictionary prunedInfoDictionaryFor(const platform::Dictionary& info);
+
+  // ---- Match rules (QVDRegistryPlugInMatching.cpp) ----
+  // A rule set maps keys naming a property of the plug-in to patterns. The
+  // evaluator only reads and never fails: a malformed piece does not match.
+
+  // Whether every entry of `rules` matches, in the set's order, stopping at
+  // the first that does not. None or an empty set matches every plug-in.
+  bool match(const std::optional<platform::Dictionary>& rules) const;
+  // One entry: "ENTITLEMENT:<name>" reads that entitlement and nothing
+  // else; "XOExtensionIdentifier", "com.corvane.uuid", "XOUserElection" and
+  // "XOExtensionContainingApp" read those properties (a plug-in without a
+  // containing application fails the last whatever the pattern); any other
+  // key, or one of those whose property is absent, reads the attributes,
+  // then the info dictionary. Then: true matches a present value other than
+  // false, false an absent or false one; a dictionary is the host's items
+  // for the value taken as an activation rule; anything else needs a string
+  // (or a list with a string element) that matches the pattern list.
+  bool matchKeyPattern(const std::string& key, const platform::Value& pattern) const;
+  // A string value against a pattern list: one string pattern, or a list of
+  // which one string must match. Anything else matches nothing.
+  bool matchValuePatterns(const platform::Value& value, const platform::Value& patterns) const;
+  // One string pattern. Operators, the first prefix that fits: "?KT-CONFORMS:"
+  // (value conforms to operand), "?KT-IS:" (operand conforms to value), any
+  // other "?" (no match, logged), "<>", "<=", ">=", "=", "<", ">"; without
+  // one, equality with the whole pattern. Comparison is compareVersionString.
+  bool matchValuePattern(const std::string& value, const std::string& pattern) const;
+  // The platform's activation-rule evaluation of `value` (the rule) against
+  // `pattern` (the host's items), logged at debug level.
+  bool matchDictionaryPattern(const platform::Value& value,
+                              const platform::Dictionary& pattern) const;
+
+  // ---- Host permission (QVDRegistryPlugInPermission.cpp) ----
+
+  // None when `client` may use this plug-in, else why not: the host's
+  // "com.corvane.developer.quorvex.allowedplugins" must be a rule set this
+  // plug-in matches (when present), and the host must hold the entitlement
+  // the plug-in names in "XOExtensionHostEntitlement" (when present).
+  std::optional<std::string> allowForClient(const QVDMbxClient& client) const;
+
+  // ---- Busy (QVDRegistryPlugInBusy.cpp) ----
+
+  // The busy token of this plug-in, {BXBundleIdentifier: identifier}, when
+  // `assertions` reports a busy running instance of its bundle; none when
+  // it reports none (or cannot answer, which is logged).
+  std::optional<platform::Dictionary> checkBusy(
+      const platform::vouchd::AssertionService& assertions) const;
 
  private:
   enum class LocalizedCache { Name, ShortName, ContainingName, StowageActionNames };

@@ -60,8 +60,9 @@ std::shared_ptr<QVDServer> QVDServer::initForService(std::string serviceName,
     std::lock_guard<std::mutex> lock(gServerMu);
     gServer = server;
   }
-  // The delegate link (the database telling the server of uninstalls) is
-  // made by the registry, which is the only source of such events.
+  // The database tells its delegate, the server, of uninstalls (held
+  // weakly by the database).
+  server->setDelegate(server);
   std::weak_ptr<QVDServer> weak = server;
   server->service_->setEventHandler([weak](const platform::mbx::Listener::Event& event) {
     if (auto self = weak.lock()) self->handleListenerEvent(event);
@@ -148,7 +149,7 @@ void QVDServer::stop() {
   syncQueue_->sync([this] {
     for (const auto& hold : holds_) {
       QVLogOps().debug("releasing plug-in hold %{public}@ because server is stopping",
-                       hold->token());
+                       hold->uuid());
     }
     holds_.clear();
     notifyAnnotationChange();
@@ -164,27 +165,6 @@ void QVDServer::submitWork(std::function<void()> work, Submission submission) {
   mainQueue_->sync(std::move(work));
 }
 
-void QVDServer::addHold(std::shared_ptr<const QVDPlugInHold> hold) {
-  syncQueue_->async([self = shared_from_this(), hold = std::move(hold)] {
-    self->holds_.push_back(hold);
-  });
-}
-
-void QVDServer::unholdClient(const std::shared_ptr<QVDMbxClient>& client) {
-  syncQueue_->async([self = shared_from_this(), client] {
-    std::erase_if(self->holds_, [&](const std::shared_ptr<const QVDPlugInHold>& hold) {
-      if (!hold->isHeldBy(client.get())) return false;
-      QVLogOps().debug("releasing plug-in hold %{public}@ of client %d", hold->token(),
-                       client->pid());
-      return true;
-    });
-  });
-}
-
-std::vector<std::shared_ptr<const QVDPlugInHold>> QVDServer::holds() const {
-  std::vector<std::shared_ptr<const QVDPlugInHold>> copy;
-  syncQueue_->sync([&] { copy = holds_; });
-  return copy;
-}
+// The hold operations are in QVDServerHolds.cpp.
 
 }  // namespace qvd

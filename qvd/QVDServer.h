@@ -35,7 +35,9 @@ enum class Submission { Asynchronous, Synchronous };
 // server in process does not).
 enum class TerminationSignal { Watched, NotWatched };
 
-class QVDServer final : public QVDatabase, public std::enable_shared_from_this<QVDServer> {
+class QVDServer final : public QVDatabase,
+                        public QVDatabaseDelegate,
+                        public std::enable_shared_from_this<QVDServer> {
  public:
   // Builds the server: the database part, the queues, the listener (not yet
   // resumed), the hold list, the process-wide instance, the preferences and
@@ -69,14 +71,32 @@ class QVDServer final : public QVDatabase, public std::enable_shared_from_this<Q
   // REQUIRES for Synchronous: not on the service queue.
   void submitWork(std::function<void()> work, Submission submission);
 
-  // Releases every hold `client` took. Returns at once; the list changes on
-  // the hold queue.
-  void unholdClient(const std::shared_ptr<QVDMbxClient>& client);
-  // Adds a hold to the list (on the hold queue; returns at once).
+  // ---- Holds and forced termination (QVDServerHolds.cpp) ----
+  // The hold operations run on the hold queue and wait for it; each change
+  // posts the annotation-change notification, so hosts re-read their
+  // plug-in lists. REQUIRES for each: not on the hold queue.
+
+  // True when any current hold blocks `plugIn`.
+  bool holdOnPlugIn(const QVDPlugIn& plugIn) const;
+  // Appends `hold` to the list, then posts.
   void addHold(std::shared_ptr<const QVDPlugInHold> hold);
-  // The holds as they are now (waits on the hold queue).
-  // REQUIRES: not on the hold queue.
+  // Removes the first hold whose token is `token` and posts; a token no
+  // hold has changes nothing and posts nothing.
+  void unholdToken(const platform::Uuid& token);
+  // Removes every hold `client` took, posting once per removed hold.
+  void unholdClient(const std::shared_ptr<QVDMbxClient>& client);
+  // The holds as they are now, in the order they were added.
   std::vector<std::shared_ptr<const QVDPlugInHold>> holds() const;
+
+  // Asks the service manager to end the running processes of each plug-in
+  // in `records`, then runs `reply` on a queue "killer-waiter" of this call
+  // once every request has been answered (at once for no records). There is
+  // no time-out. Returns at once.
+  void terminatePlugInsReply(std::vector<platform::holvane::PlugInRecord> records,
+                             std::function<void()> reply);
+  // The database's delegate: ends the processes of plug-ins being
+  // uninstalled. Returns at once; termination goes on in the background.
+  void removedPlugIns(const std::vector<platform::holvane::PlugInRecord>& records) override;
 
   const std::string& serviceName() const { return serviceName_; }
   const Platform& platform() const { return platform_; }

@@ -28,7 +28,7 @@ platform::Status QVDatabase::initDatabase(std::optional<std::string> databasePat
   annotations_ = std::move(store).value();
   registry_ = services.registry;
   notifications_ = services.notifications;
-  plugInServices_ = {services.registry, services.locale, services.extensions};
+  plugInServices_ = {services.registry, services.locale, services.extensions, services.types};
 
   // The observers outlive nothing they borrow: both hold the cache weakly.
   // The registry runs its observers on its own queue, and the database
@@ -37,12 +37,23 @@ platform::Status QVDatabase::initDatabase(std::optional<std::string> databasePat
   // the other, so the drop is queued instead. It still runs before any
   // look-up submitted after the notice.
   std::weak_ptr<QVDPlugInCache> weakCache = cache_;
-  registry_->addUninstallObserver([weakCache](const platform::holvane::PlugInRecord& record) {
+  // The delegate is told after the drop, from the database queue: it only
+  // starts the termination of the plug-ins' processes, whose replies and
+  // wait run on queues of their own, so nothing waits on this queue.
+  std::weak_ptr<DelegateSlot> weakDelegate = delegate_;
+  registry_->addUninstallObserver([weakCache, weakDelegate](
+                                      const platform::holvane::PlugInRecord& record) {
     const std::shared_ptr<QVDPlugInCache> cache = weakCache.lock();
     if (!cache) return;
-    const platform::Uuid uuid = record.uuid;
-    cache->queue()->async([weakCache, uuid] {
-      if (auto alive = weakCache.lock()) alive->remove(uuid);
+    cache->queue()->async([weakCache, weakDelegate, record] {
+      if (auto alive = weakCache.lock()) alive->remove(record.uuid);
+      const std::shared_ptr<DelegateSlot> slot = weakDelegate.lock();
+      std::shared_ptr<QVDatabaseDelegate> delegate;
+      if (slot) {
+        std::lock_guard<std::mutex> lock(slot->mu);
+        delegate = slot->delegate.lock();
+      }
+      if (delegate) delegate->removedPlugIns({record});
     });
   });
 
@@ -120,6 +131,16 @@ void QVDatabase::autoElect(const QVDPlugIn& plugIn) {
   }
   annotation.set(QVAnnotationElectionKey, platform::Value(1));
   annotations_->setAnnotationForPlugIn(std::move(annotation), plugIn);
+}
+
+void QVDatabase::setDelegate(std::weak_ptr<QVDatabaseDelegate> delegate) {
+  std::lock_guard<std::mutex> lock(delegate_->mu);
+  delegate_->delegate = std::move(delegate);
+}
+
+std::shared_ptr<QVDatabaseDelegate> QVDatabase::delegate() const {
+  std::lock_guard<std::mutex> lock(delegate_->mu);
+  return delegate_->delegate.lock();
 }
 
 std::size_t QVDatabase::cacheCount() const {

@@ -17,6 +17,7 @@
 #include <atomic>
 #include <cstdint>
 #include <memory>
+#include <mutex>
 #include <optional>
 #include <string>
 #include <string_view>
@@ -56,6 +57,17 @@ std::int64_t electionInteger(const platform::Value& election);
 // The election key of a value: its integer's low 8 bits, unsigned, in
 // decimal ("255" for -1).
 std::string electionKey(const platform::Value& election);
+
+// Told by the database of plug-ins being uninstalled. The server is the
+// database's delegate and ends the plug-ins' running processes.
+class QVDatabaseDelegate {
+ public:
+  virtual ~QVDatabaseDelegate() = default;
+  // Called once the records' cache entries are gone, on the database's
+  // queue: an implementation must return at once and must not wait on that
+  // queue.
+  virtual void removedPlugIns(const std::vector<platform::holvane::PlugInRecord>& records) = 0;
+};
 
 class QVDatabase {
  public:
@@ -129,6 +141,12 @@ class QVDatabase {
   // The database's own serial queue, "QVDatabase".
   const std::shared_ptr<platform::dispatch::SerialQueue>& syncQueue() const { return sync_; }
 
+  // ---- Delegate (QVDatabase.cpp) ----
+
+  // Held weakly; read each time it is called.
+  void setDelegate(std::weak_ptr<QVDatabaseDelegate> delegate);
+  std::shared_ptr<QVDatabaseDelegate> delegate() const;
+
   static constexpr std::uint64_t kDefaultCacheLimit = 1000000;
 
  protected:
@@ -157,6 +175,13 @@ class QVDatabase {
   std::shared_ptr<platform::notify::NotificationCenter> notifications_;
   QVDPlugIn::Services plugInServices_;
   platform::notify::ObservationHandle regionObserver_;
+  // The delegate, shared with the uninstall observer (which holds it
+  // weakly, as it does the cache).
+  struct DelegateSlot {
+    mutable std::mutex mu;
+    std::weak_ptr<QVDatabaseDelegate> delegate;  // guarded by mu
+  };
+  const std::shared_ptr<DelegateSlot> delegate_ = std::make_shared<DelegateSlot>();
 };
 
 }  // namespace qvd

@@ -120,7 +120,18 @@ void Transaction::done() {
   }
   probes::requestOutput(client_->pid(), [&] { return platform::Value(reply_.body()).description(); });
   // Sent without waiting; a client that has gone meanwhile gets nothing.
-  reply_.send();
+  platform::Status sent = reply_.send();
+  if (sent.ok()) return;
+  // The answer cannot be framed (most often: more forms than one message
+  // carries). The client still gets a reply, saying why.
+  QVLogOps().error("reply to request %llu of client %d not sent: %{public}@",
+                   static_cast<unsigned long long>(reply_.requestId()), client_->pid(),
+                   sent.error());
+  reply_.body() = platform::Dictionary{
+      {std::string(QVDErrorCodeKey), static_cast<std::uint64_t>(QVErrorInvalidRequest)},
+      {std::string(QVDErrorKey), "reply too large to send (" + sent.error().description() +
+                                     "); narrow the request"}};
+  (void)reply_.send();
 }
 
 void Transaction::failMessage(std::int64_t code, std::string message) {

@@ -12,9 +12,7 @@ void Transaction::notYetServed() { failMessage(QVErrorInvalidRequest, "unrecogni
 void Transaction::addPlugIns() { notYetServed(); }
 void Transaction::removePlugIns() { notYetServed(); }
 void Transaction::bulkPlugIns() { notYetServed(); }
-void Transaction::matchPlugIns() { notYetServed(); }
 void Transaction::readyPlugIns() { notYetServed(); }
 void Transaction::accessPlugIns() { notYetServed(); }
-void Transaction::lockDownPlugIns() { notYetServed(); }
 
 }  // namespace qvd

@@ -67,7 +67,7 @@ std::string rawSocketPath() {
       if (message == nullptr || !message->expectsReply()) return;
       mbx::Reply reply = mbx::Reply::createReply(*message);
       reply.body() = *message->dictionary();
-      reply.send();
+      (void)reply.send();
     });
     (*connection)->resume();
   });

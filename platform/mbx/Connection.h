@@ -131,7 +131,9 @@ class Connection : public std::enable_shared_from_this<Connection> {
       std::string_view serviceName, int fd, std::shared_ptr<const PeerIdentity> peer,
       const ConnectionLimits& limits);
 
-  void sendReply(std::uint64_t requestId, platform::Value body);
+  // Fails only when `body` cannot be framed; a reply that cannot be
+  // delivered (the peer has gone) is dropped and logged.
+  platform::Status sendReply(std::uint64_t requestId, platform::Value body);
   // Stamps the next message id on `frame` and writes or queues it; registers
   // `pending` under that id when given. Fails only when nothing was sent.
   platform::Status transmit(std::vector<std::uint8_t> frame, internal::PendingReply* pending);

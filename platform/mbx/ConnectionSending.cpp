@@ -190,17 +190,18 @@ void Connection::sendGoodbye() {
   if (frame.ok()) (void)transmit(std::move(frame).value(), nullptr);
 }
 
-void Connection::sendReply(std::uint64_t requestId, Value body) {
+Status Connection::sendReply(std::uint64_t requestId, Value body) {
   Result<std::vector<std::uint8_t>> frame = encodeFrame(FrameKind::Reply, requestId, body);
   if (!frame.ok()) {
     mbxLog().error("%{public}s: reply to request %llu not sent: %@", description(),
                    ull(requestId), frame.error());
-    return;
+    return frame.error();
   }
   if (Status sent = transmit(std::move(frame).value(), nullptr); !sent.ok()) {
     mbxLog().debug("%{public}s: reply to request %llu dropped: %@", description(),
                    ull(requestId), sent.error());
   }
+  return okStatus();
 }
 
 Status Connection::transmit(std::vector<std::uint8_t> frame, PendingReply* pending) {

@@ -7,7 +7,7 @@
 //   void handle(const mbx::Message& request) {
 //     auto reply = mbx::Reply::createReply(request);
 //     reply.body().set("status", 0);
-//     reply.send();
+//     (void)reply.send();
 //   }
 //
 // Thread safety: a plain value; build and send it from one thread at a time.
@@ -19,6 +19,7 @@
 
 #include "platform/mbx/KeepAliveTransaction.h"
 #include "platform/mbx/Message.h"
+#include "platform/values/Result.h"
 #include "platform/values/Value.h"
 
 namespace platform::mbx {
@@ -39,7 +40,11 @@ class Reply {
 
   // Sends the body (moved out) once; later calls do nothing. Ends the
   // request's keep-alive transaction as far as this reply is concerned.
-  void send();
+  // Fails, sending nothing and keeping the body, when the body cannot be
+  // put into a frame (BodyTooLarge, or a value the codec cannot carry): the
+  // caller may then replace the body and send again, so that the peer is
+  // never left waiting for a reply that will not come.
+  platform::Status send();
   bool sent() const { return sent_; }
 
  private:

@@ -50,6 +50,7 @@ struct Invocation {
   std::vector<std::string> paths;  // add, remove, hold: absolute
   std::uint64_t flags = 0;  // bulk, match (QVDiscoverSynchronous with --sync), ready, access, hold
   QVDSending sending = QVDSending::Asynchronous;    // ready, access
+  bool waitForEndOfInput = false;                   // hold --wait
   platform::Dictionary rules;                       // match
   std::optional<platform::Dictionary> environment;  // ready
   QVDPlugInMap plugIns;                             // ready, access

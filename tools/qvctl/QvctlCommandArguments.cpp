@@ -48,10 +48,11 @@ Status parseCommandArguments(Invocation& invocation, std::span<const std::string
     case Command::Remove:
     case Command::Hold: {
       Result<Scanned> s =
-          invocation.command == Command::Hold ? scan(args, {"--flags"}, {}) : scan(args, {}, {});
+          invocation.command == Command::Hold ? scan(args, {"--flags"}, {"--wait"}) : scan(args, {}, {});
       if (!s.ok()) return s.error();
       if (Status n = needOperands(s.value(), 1, kAnyNumber); !n.ok()) return n;
       if (Status f = syncAndFlags(s.value(), invocation); !f.ok()) return f;
+      invocation.waitForEndOfInput = s.value().count("--wait") > 0;
       Result<std::vector<std::string>> paths = absolutePaths(s.value().operands, cwd);
       if (!paths.ok()) return paths.error();
       invocation.paths = std::move(paths).value();

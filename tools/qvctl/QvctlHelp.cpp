@@ -47,10 +47,14 @@ constexpr std::array kCommands{
     CommandInfo{"bulk-annotate", Command::BulkAnnotate, "bulk-annotate --annotations JSON",
                 "set annotations of many plug-ins in one request",
                 "Example: qvctl bulk-annotate --annotations \"$(cat annotations.json)\"\n"},
-    CommandInfo{"hold", Command::Hold, "hold [--flags N] PATH...",
+    CommandInfo{"hold", Command::Hold, "hold [--flags N] [--wait] PATH...",
                 "put a hold on the plug-ins at PATH and print the hold's token",
-                "The hold lasts until 'qvctl release TOKEN'.\n"
-                "Example: token=$(qvctl hold /Applications/Maps.app)\n"},
+                "  --flags N  0x1 PATHs are plug-ins (else applications), 0x2 refuse if\n"
+                "             busy, 0x4 end the plug-ins' processes first\n"
+                "  --wait     keep the hold until standard input ends, then release it\n"
+                "A hold lasts as long as the connection that took it, so without --wait it\n"
+                "ends when qvctl exits; 'qvctl release TOKEN' ends it earlier.\n"
+                "Example: sleep 60 | qvctl hold --wait --flags 1 /Applications/Maps.app/PlugIns/Route.ovx\n"},
     CommandInfo{"release", Command::Release, "release TOKEN",
                 "end the hold that 'qvctl hold' printed TOKEN for",
                 "Example: qvctl release \"$token\"\n"},

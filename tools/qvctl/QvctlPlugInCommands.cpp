@@ -39,6 +39,19 @@ int printHold(const Session& session, const Dictionary& body) {
   return kExitOk;
 }
 
+// The hold lives as long as this connection: keep it until standard input
+// ends, then release it and say so.
+int keepHoldUntilEndOfInput(const Session& session, const Uuid& token) {
+  std::fflush(session.environment.out);
+  char buffer[256];
+  while (std::fread(buffer, 1, sizeof buffer, stdin) > 0) {
+  }
+  Result<Value> reply = awaitReply(
+      [&](QVDReplyHandler done) { session.client.releaseHold(token, std::move(done)); });
+  if (!successfulReply(reply, session.environment.err)) return kExitError;
+  return kExitOk;
+}
+
 }  // namespace
 
 int runPlugInCommand(const Session& session) {
@@ -65,7 +78,11 @@ int runPlugInCommand(const Session& session) {
   });
   std::optional<Dictionary> body = successfulReply(reply, session.environment.err);
   if (!body) return kExitError;
-  if (invocation.command == Command::Hold) return printHold(session, *body);
+  if (invocation.command == Command::Hold) {
+    const int printed = printHold(session, *body);
+    if (printed != kExitOk || !invocation.waitForEndOfInput) return printed;
+    return keepHoldUntilEndOfInput(session, *holdToken(*body));
+  }
   printReply(session, *body);
   return kExitOk;
 }

@@ -119,7 +119,7 @@ TEST_F(MbxConnection, LargeRepliesDrainThroughTheOutputQueue) {
   TestServer server("large", {}, [](const std::shared_ptr<Connection>&, const Message& m) {
     Reply reply = Reply::createReply(m);
     reply.body().set("blob", Data(8u << 20, 0x5a));
-    reply.send();
+    (void)reply.send();
   });
   auto connection = connect("large");
   ASSERT_NE(connection, nullptr);
@@ -188,7 +188,7 @@ TEST_F(MbxConnection, AReplyToAVanishedSenderIsDroppedHarmlessly) {
   std::optional<Message> held;
   const std::size_t baseline = activeTransactionCount();
   TestServer server("vanish", {}, [&](const std::shared_ptr<Connection>&, const Message& m) {
-    if (m.dictionary()->get("op") != Value("slow")) return Reply::createReply(m).send();
+    if (m.dictionary()->get("op") != Value("slow")) return (void)Reply::createReply(m).send();
     std::lock_guard lock(mu);
     held = m;  // answered later, once the sender is gone
   });
@@ -199,7 +199,7 @@ TEST_F(MbxConnection, AReplyToAVanishedSenderIsDroppedHarmlessly) {
     ASSERT_TRUE(held.has_value());
     EXPECT_EQ(activeTransactionCount(), baseline + 1);  // the unanswered request
     Reply reply = Reply::createReply(*held);
-    reply.send();
+    (void)reply.send();
     EXPECT_TRUE(reply.sent());
     held.reset();
     EXPECT_EQ(activeTransactionCount(), baseline);
@@ -268,7 +268,7 @@ TEST_F(MbxConnection, MisuseAndBoundsAreErrorsNotHangs) {
   // Answering one makes room again; the connection never closed.
   {
     std::lock_guard lock(mu);
-    Reply::createReply(unanswered[0]).send();
+    (void)Reply::createReply(unanswered[0]).send();
   }
   ASSERT_TRUE(eventually([&] { return outcomes->size() == 2; }));
   connection->sendWithReply(Dictionary{{"i", 4}}, nullptr, record);

@@ -92,7 +92,7 @@ TEST_F(MbxMalformed, APeerThatNeverReadsIsCutOffAtTheOutputLimit) {
   TestServer server("deaf", limits, [&](const std::shared_ptr<Connection>& c, const Message& m) {
     Reply reply = Reply::createReply(m);
     reply.body().set("blob", Data(64u << 10, 1));
-    reply.send();
+    (void)reply.send();
     mostQueued = std::max(mostQueued.load(), c->queuedOutputBytesForTesting());
   });
   log::LogCaptureForTesting capture;

@@ -41,7 +41,7 @@ void handleRequest(const std::shared_ptr<mbx::Connection>& connection, const mbx
   auto reply = mbx::Reply::createReply(m);
   reply.body().set("echo", m.body());
   reply.body().set("pid", static_cast<long long>(::getpid()));
-  reply.send();
+  (void)reply.send();
 }
 
 int serve(const std::string& service) {

@@ -51,7 +51,7 @@ void TestServer::adopt(const std::shared_ptr<Connection>& connection) {
       } else {
         Reply reply = Reply::createReply(*message);
         reply.body().set("echo", message->body());
-        reply.send();
+        (void)reply.send();
       }
     } else if (const Dictionary* body = message->dictionary()) {
       const Value* seq = body->find("seq");

@@ -45,7 +45,7 @@ TEST_F(DispatchTest, EnvelopeErrors) {
     EXPECT_EQ(reply->dictionary()->size(), 2u) << "only the error keys";
   }
   // Table names not yet served are refused exactly as an unknown name is.
-  for (auto name : {QVDAddRequest, QVDMatchRequest, QVDLockdownRequest}) {
+  for (auto name : {QVDAddRequest, QVDReadyRequest}) {
     auto reply = client.call(request(name));
     ASSERT_TRUE(reply.ok());
     EXPECT_EQ(errorOf(*reply), (ErrorReply{4, "unrecognized request"})) << name;

@@ -24,7 +24,8 @@ const std::string& testRoot() {
 Platform FakePlatform::platform() const {
   return Platform{.entitlements = entitlements, .sandbox = sandbox, .preferences = preferences,
                   .notifications = notifications, .containers = containers, .registry = registry,
-                  .locale = locale, .extensions = extensions};
+                  .locale = locale, .extensions = extensions, .types = types,
+                  .serviceManager = serviceManager, .assertions = assertions};
 }
 
 bool eventually(const std::function<bool()>& done, std::chrono::milliseconds limit) {

@@ -14,12 +14,15 @@
 #include "platform/container/testing/FakeContainerManager.h"
 #include "platform/holvane/testing/FakeRegistry.h"
 #include "platform/locale/testing/FakeLocaleService.h"
+#include "platform/lumend/testing/FakeServiceManager.h"
 #include "platform/mbx/Connection.h"
 #include "platform/notify/testing/FakeNotificationCenter.h"
 #include "platform/prefs/testing/FakePreferenceStore.h"
 #include "platform/sandbox/testing/FakeSandboxCheck.h"
 #include "platform/sandbox/testing/FakeSandboxExtensions.h"
+#include "platform/types/testing/FakeTypeRegistry.h"
 #include "platform/values/Dictionary.h"
+#include "platform/vouchd/testing/FakeAssertionService.h"
 #include "qvd/QVDMbxClient.h"
 #include "qvd/QVDServer.h"
 
@@ -44,6 +47,12 @@ struct FakePlatform {
       std::make_shared<platform::locale::FakeLocaleService>();
   std::shared_ptr<platform::sandbox::FakeSandboxExtensions> extensions =
       std::make_shared<platform::sandbox::FakeSandboxExtensions>();
+  std::shared_ptr<platform::types::FakeTypeRegistry> types =
+      std::make_shared<platform::types::FakeTypeRegistry>();
+  std::shared_ptr<platform::lumend::FakeServiceManager> serviceManager =
+      std::make_shared<platform::lumend::FakeServiceManager>();
+  std::shared_ptr<platform::vouchd::FakeAssertionService> assertions =
+      std::make_shared<platform::vouchd::FakeAssertionService>();
   Platform platform() const;
 };
 

@@ -36,7 +36,7 @@ struct FakeDaemon::State {
       return;
     }
     lock.unlock();
-    reply.send();
+    (void)reply.send();
   }
 };
 
@@ -88,7 +88,7 @@ void FakeDaemon::releaseReplies() {
     state_->holding = false;
     held.swap(state_->held);
   }
-  for (Reply& reply : held) reply.send();
+  for (Reply& reply : held) (void)reply.send();
 }
 
 void FakeDaemon::dropConnections() {

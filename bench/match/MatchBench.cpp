@@ -1,0 +1,150 @@
+// "match" end to end: a real qvd on synthetic roots of 100, 1,000 and
+// 10,000 plug-ins (50 per extension point), asked through QVDaemonClient as
+// a host asks. Reports medians of a match without rules, of one that
+// selects one extension point (50 plug-ins), and of a version-operator rule
+// over all, with the growth from 1,000 to 10,000 next to each.
+#include <stdlib.h>
+#include <unistd.h>
+
+#include <cstdio>
+#include <filesystem>
+#include <map>
+#include <string>
+
+#include "Quorvex/QVDConstants.h"
+#include "Quorvex/QVDaemonClient.h"
+#include "bench/match/DaemonProcess.h"
+#include "bench/registry/Measure.h"
+#include "bench/registry/SyntheticRoot.h"
+#include "platform/dispatch/Semaphore.h"
+#include "platform/root/Root.h"
+
+namespace {
+
+using bench::registry::grouped;
+using bench::registry::median;
+using bench::registry::millis;
+using bench::registry::secondsOf;
+using bench::registry::times;
+using platform::Dictionary;
+
+constexpr std::size_t kPerPoint = 50;
+
+// Sends one match and waits for it; the number of forms, or -1 on error.
+long matchOnce(QVDaemonClient& client, const Dictionary& rules) {
+  platform::dispatch::Semaphore answered;
+  long forms = -1;
+  client.matchPlugIns(rules, 0, [&](const platform::Result<platform::Value>& reply) {
+    if (!reply.ok()) {
+      std::fprintf(stderr, "match: %s\n", reply.error().description().c_str());
+    } else if (auto error = QVDaemonClient::errorInReply(reply)) {
+      std::fprintf(stderr, "match: %s\n", error->description().c_str());
+    } else {
+      const platform::Dictionary* body = reply->dictionary();
+      const platform::Array* matches = body ? body->get(QVDMatchesKey).array() : nullptr;
+      if (matches) forms = static_cast<long>(matches->size());
+    }
+    answered.signal();
+  });
+  answered.wait();
+  return forms;
+}
+
+struct Figures {
+  double firstAll = 0;  // the first match creates every plug-in object
+  double all = 0;
+  double point = 0;
+  double version = 0;
+  long residentAfter = -1;
+};
+
+bool measure(const std::string& qvd, const std::string& base, std::size_t plugIns, Figures& out) {
+  auto root = bench::registry::SyntheticRoot::make(base + "/n" + std::to_string(plugIns), plugIns,
+                                                   plugIns / kPerPoint);
+  if (!root.ok()) {
+    std::fprintf(stderr, "root: %s\n", root.error().description().c_str());
+    return false;
+  }
+  auto daemon = bench::match::DaemonProcess::start(qvd, root->path());
+  if (!daemon.ok()) {
+    std::fprintf(stderr, "%s\n", daemon.error().description().c_str());
+    return false;
+  }
+  platform::setRootDirectoryForTesting(root->path());
+  auto client = QVDaemonClient::initWithServiceName(std::string(QVDServiceName));
+  if (!client.ok()) return false;
+
+  const Dictionary none;
+  const Dictionary point{{"XOExtensionPointName", bench::registry::SyntheticRoot::pointName(1)}};
+  const Dictionary version{{"XOExtensionVersion", ">=1.0"}};
+  long forms = 0;
+  out.firstAll = secondsOf([&] { forms = matchOnce(**client, none); });
+  if (forms != static_cast<long>(plugIns)) {
+    std::fprintf(stderr, "match without rules gave %ld forms of %zu\n", forms, plugIns);
+    return false;
+  }
+  const int rounds = plugIns >= 10'000 ? 7 : 21;
+  std::vector<double> all, one, versions;
+  for (int i = 0; i < rounds; ++i) {
+    all.push_back(secondsOf([&] { forms = matchOnce(**client, none); }));
+    if (forms != static_cast<long>(plugIns)) return false;
+    versions.push_back(secondsOf([&] { forms = matchOnce(**client, version); }));
+    if (forms != static_cast<long>(plugIns)) return false;
+    for (int j = 0; j < 10; ++j) {
+      one.push_back(secondsOf([&] { forms = matchOnce(**client, point); }));
+      if (forms != static_cast<long>(kPerPoint)) {
+        std::fprintf(stderr, "point match gave %ld forms\n", forms);
+        return false;
+      }
+    }
+  }
+  out.all = median(all);
+  out.point = median(one);
+  out.version = median(versions);
+  out.residentAfter = daemon->residentBytes();
+  return true;
+}
+
+}  // namespace
+
+int main() {
+  const char* tmp = std::getenv("TMPDIR");
+  std::string base = std::string(tmp ? tmp : "/tmp") + "/qv-match-bench-XXXXXX";
+  if (::mkdtemp(base.data()) == nullptr) return 1;
+  std::map<std::size_t, Figures> figures;
+  bool ok = true;
+  for (std::size_t n : {100, 1'000, 10'000}) {
+    if (!measure(QVD_PATH, base, n, figures[n])) {
+      ok = false;
+      break;
+    }
+  }
+  std::error_code ignored;
+  std::filesystem::remove_all(base, ignored);
+  if (!ok) return 1;
+
+  bench::registry::Table table;
+  table.section("match through QVDaemonClient (medians; 50 plug-ins per extension point)");
+  for (const auto& [n, f] : figures) {
+    table.add("no rules, " + grouped(n) + ", first (creates the plug-ins)", millis(f.firstAll));
+    table.add("no rules, " + grouped(n), millis(f.all),
+              n == 1'000 ? (f.all < 0.050 ? "target < 50 ms: met" : "target < 50 ms: MISSED")
+                         : "");
+    table.add("one extension point (50 of " + grouped(n) + ")", millis(f.point),
+              n == 10'000 ? (f.point < 0.005 ? "target < 5 ms: met" : "target < 5 ms: MISSED")
+                          : "");
+    table.add("XOExtensionVersion >=1.0 (all of " + grouped(n) + ")", millis(f.version));
+    table.add("  daemon resident memory afterwards",
+              bench::registry::format("%.1f MiB", f.residentAfter / 1048576.0));
+  }
+  const Figures& k1 = figures[1'000];
+  const Figures& k10 = figures[10'000];
+  table.section("growth from 1,000 to 10,000 plug-ins (linear: 10x or less)");
+  table.add("no rules", times(k10.all / k1.all), k10.all / k1.all <= 11 ? "met" : "MISSED");
+  table.add("one extension point (50 either way)", times(k10.point / k1.point),
+            "near 1: the point's plug-ins only");
+  table.add("version rule", times(k10.version / k1.version),
+            k10.version / k1.version <= 11 ? "met" : "MISSED");
+  table.print();
+  return 0;
+}

@@ -1,0 +1,98 @@
+#include "platform/lumend/LinuxServiceManager.h"
+
+#include <errno.h>
+#include <signal.h>
+
+#include <utility>
+#include <vector>
+
+#include "platform/bundle/Bundle.h"
+#include "platform/dispatch/SerialQueue.h"
+#include "platform/lumend/internal/LumendLog.h"
+#include "platform/lumend/internal/ProcessScan.h"
+#include "platform/lumend/internal/ServiceRecords.h"
+#include "platform/root/Root.h"
+
+namespace platform::lumend {
+
+using internal::lumendLog;
+
+LinuxServiceManager::LinuxServiceManager(ServiceManagerOptions options)
+    : options_(std::move(options)) {
+  if (options_.recordsDirectory.empty()) options_.recordsDirectory = rootPath("run/quorvex/lumend");
+}
+
+int LinuxServiceManager::addExternalService(int hostPid, const std::string& executablePath,
+                                            const Dictionary& overlay) {
+  if (hostPid <= 0) return ESRCH;
+  if (::kill(hostPid, 0) != 0 && errno == ESRCH) return ESRCH;
+  if (executablePath.empty() || executablePath.front() != '/') return EINVAL;
+  Result<bundle::Bundle> around =
+      bundle::Bundle::create(executablePath, bundle::BundlePathKind::Executable);
+  const Dictionary* info = around.ok() ? around->infoDictionary() : nullptr;
+  const std::string* identifier = info ? info->get("BXBundleIdentifier").string() : nullptr;
+  if (identifier == nullptr || !internal::isRecordableBundleIdentifier(*identifier)) {
+    lumendLog().error("no bundle identifier around %{public}s", executablePath);
+    return EINVAL;
+  }
+  Status written = internal::writeServiceRecord(options_.recordsDirectory, hostPid, *identifier,
+                                                executablePath, overlay);
+  if (!written.ok()) {
+    lumendLog().error("cannot record %{public}s for %d: %@", *identifier, hostPid, written.error());
+    const Error& error = written.error();
+    return error.domain() == kPosixErrorDomain ? static_cast<int>(error.code()) : EIO;
+  }
+  return 0;
+}
+
+void LinuxServiceManager::removeExternalService(const std::string& bundleIdentifier,
+                                                const std::string& version,
+                                                std::shared_ptr<dispatch::Queue> queue,
+                                                RemovalReply reply) {
+  auto removal = dispatch::SerialQueue::create("lumend.removal");
+  // The work owns a copy of the manager's options, so a manager destroyed
+  // meanwhile leaves the removal whole.
+  removal->async([manager = LinuxServiceManager(options_), bundleIdentifier, version,
+                  queue = std::move(queue), reply = std::move(reply)]() mutable {
+    lumendLog().debug("removing %{public}s (version %{public}s)", bundleIdentifier, version);
+    const int error = manager.removeNow(bundleIdentifier).error;
+    queue->async([reply = std::move(reply), error] { reply(error); });
+  });
+}
+
+RemovalOutcome LinuxServiceManager::removeNow(const std::string& bundleIdentifier) const {
+  RemovalOutcome outcome;
+  if (!internal::isRecordableBundleIdentifier(bundleIdentifier)) {
+    outcome.error = EINVAL;
+    return outcome;
+  }
+  internal::ScanRequest scan{
+      .procDirectory = options_.procDirectory,
+      .bundleIdentifier = bundleIdentifier,
+      .executables = internal::recordedExecutables(options_.recordsDirectory, bundleIdentifier,
+                                                   options_.maxHostDirectories),
+      .maxProcesses = options_.maxProcesses};
+  std::vector<internal::ProcessHandle> instances = internal::findInstances(scan);
+  std::vector<internal::ProcessHandle> signalled;
+  for (internal::ProcessHandle& instance : instances) {
+    if (!instance.signal(SIGTERM)) continue;  // it ended on its own meanwhile
+    lumendLog().info("sent SIGTERM to %d of %{public}s", instance.pid(), bundleIdentifier);
+    signalled.push_back(std::move(instance));
+  }
+  outcome.signalled = signalled.size();
+  if (internal::awaitExit(signalled, options_.exitGrace) > 0) {
+    for (const internal::ProcessHandle& instance : signalled) {
+      if (instance.exited() || !instance.signal(SIGKILL)) continue;
+      lumendLog().error("%d of %{public}s outlived SIGTERM; sent SIGKILL", instance.pid(),
+                        bundleIdentifier);
+      ++outcome.killed;
+    }
+    outcome.survivors = internal::awaitExit(signalled, options_.killGrace);
+  }
+  outcome.recordsDropped = internal::dropServiceRecords(options_.recordsDirectory, bundleIdentifier,
+                                                        options_.maxHostDirectories);
+  outcome.error = outcome.signalled > 0 ? 0 : ESRCH;
+  return outcome;
+}
+
+}  // namespace platform::lumend

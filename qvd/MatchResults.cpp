@@ -1,0 +1,114 @@
+#include "qvd/MatchResults.h"
+
+#include <algorithm>
+#include <utility>
+
+#include "Quorvex/QVDConstants.h"
+#include "Quorvex/QVLog.h"
+#include "Quorvex/QVPlugInConstants.h"
+#include "Quorvex/QVVersionComparison.h"
+#include "qvd/Transaction.h"
+
+namespace qvd {
+
+namespace {
+
+std::string textOf(const platform::Dictionary& form, std::string_view key) {
+  const std::string* text = form.get(key).string();
+  return text ? *text : std::string();
+}
+
+}  // namespace
+
+std::string versionText(const QVDPlugIn& plugIn) {
+  const platform::Value version = plugIn.version();
+  if (const std::string* text = version.string()) return *text;
+  return version.isNone() ? std::string(QVFormNoVersion) : version.description();
+}
+
+MatchResults::MatchResults(std::uint64_t flags, std::shared_ptr<const Transaction> transaction)
+    : flags_(flags),
+      transaction_(std::move(transaction)),
+      queue_(platform::dispatch::SerialQueue::create("com.corvane.qvd.postExporting",
+                                                     platform::dispatch::Priority::UserInitiated)) {}
+
+bool MatchResults::preferred(const QVDPlugIn& plugIn, const platform::Dictionary& kept) {
+  const bool keptOnSystem = kept.get(QVFormSystemResidentKey).boolean().value_or(false);
+  if (!plugIn.onSystemVolume() && keptOnSystem) return false;
+  if (plugIn.onSystemVolume() && !keptOnSystem) return true;
+  // Equal times keep the form that was there first.
+  const std::int64_t keptModified = kept.get(QVFormLastModifiedKey).int64().value_or(0);
+  return static_cast<std::int64_t>(plugIn.lastModified()) > keptModified;
+}
+
+MatchResults::Verdict MatchResults::compare(const QVDPlugIn& plugIn,
+                                            const platform::Dictionary& kept) const {
+  const QVOrdering order =
+      compareVersionString(versionText(plugIn), textOf(kept, QVFormVersionKey));
+  const bool keepVersions = (flags_ & QVDiscoverKeepVersions) != 0;
+  const bool keepDuplicates = keepVersions && (flags_ & QVDiscoverKeepDuplicates) != 0;
+  if (order == QVOrdering::Same) {
+    if (keepDuplicates) return Verdict::KeepBoth;
+    return preferred(plugIn, kept) ? Verdict::ReplaceKept : Verdict::DropNew;
+  }
+  if (keepVersions) return Verdict::KeepBoth;
+  return order == QVOrdering::Descending ? Verdict::ReplaceKept : Verdict::DropNew;
+}
+
+void MatchResults::merge(const QVDPlugIn& plugIn, const platform::Dictionary& form) {
+  QV_ASSERT_ON_QUEUE(queue_);
+  const std::string identifier = plugIn.identifier().value_or("");
+  for (auto kept = matches_.begin(); kept != matches_.end(); ++kept) {
+    if (textOf(**kept, QVFormIdentifierKey) != identifier) continue;
+    const Verdict verdict = compare(plugIn, **kept);
+    if (verdict == Verdict::KeepBoth) continue;
+    if (verdict == Verdict::DropNew) return;
+    matches_.erase(kept);
+    break;
+  }
+  auto merged = std::make_shared<platform::Dictionary>(form);
+  transaction_->addAnnotationForPlugIn(plugIn, *merged);
+  plugIn.augmentForm(*merged);
+  matches_.push_back(merged);
+  recordReplacements(plugIn, merged);
+}
+
+void MatchResults::recordReplacements(const QVDPlugIn& plugIn, const Form& form) {
+  const platform::Value declared = plugIn.valueForEntitlement(QVOverrideEntitlement);
+  if (const std::string* replaced = declared.string()) {
+    overrides_[*replaced] = form;
+  } else if (const platform::Array* list = declared.array()) {
+    for (const platform::Value& entry : *list) {
+      if (const std::string* replaced = entry.string()) overrides_[*replaced] = form;
+    }
+  }
+}
+
+void MatchResults::finish() {
+  if (!overrides_.empty()) {
+    for (const Form& replaced : matches_) {
+      auto found = overrides_.find(textOf(*replaced, QVFormIdentifierKey));
+      if (found == overrides_.end()) continue;
+      const Form& replacing = found->second;
+      // Read before writing: a plug-in that names its own identifier is
+      // both forms at once.
+      const platform::Value replacingUuid = replacing->get(QVFormUUIDKey);
+      const platform::Value replacedIdentifier = replaced->get(QVFormIdentifierKey);
+      replaced->set(QVOverriderFormKey, replacingUuid);
+      replacing->set(QVOverridingFormKey, replacedIdentifier);
+      QVLogOps().info("plug-in %{public}@ overrides %{public}@", replacingUuid,
+                      replaced->get(QVFormUUIDKey));
+    }
+  }
+  std::stable_sort(matches_.begin(), matches_.end(), [](const Form& a, const Form& b) {
+    const std::string aId = textOf(*a, QVFormIdentifierKey);
+    const std::string bId = textOf(*b, QVFormIdentifierKey);
+    if (aId != bId) return aId < bId;
+    const QVOrdering order =
+        compareVersionString(textOf(*a, QVFormVersionKey), textOf(*b, QVFormVersionKey));
+    if (order != QVOrdering::Same) return order == QVOrdering::Ascending;
+    return textOf(*a, QVFormPathKey) < textOf(*b, QVFormPathKey);
+  });
+}
+
+}  // namespace qvd

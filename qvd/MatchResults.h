@@ -1,0 +1,74 @@
+// The results of one "match" request while its exports finish: the kept
+// forms, the replacement declarations, and the version-duplicate rule that
+// decides which of two forms of one identifier stays. Everything that
+// compares plug-ins with each other happens in merge(), on the request's own
+// serial post-export queue, so the lists need no lock.
+//
+// Thread safety: merge() runs on postExportQueue() only; the getters and
+// finish() on the request's queue after every export has been waited for.
+#pragma once
+
+#include <cstdint>
+#include <map>
+#include <memory>
+#include <string>
+#include <vector>
+
+#include "platform/dispatch/SerialQueue.h"
+#include "platform/values/Dictionary.h"
+#include "qvd/QVDPlugIn.h"
+
+namespace qvd {
+
+class Transaction;
+
+class MatchResults {
+ public:
+  // A kept form; shared so that a replacement declaration keeps pointing at
+  // the same form when other forms come and go.
+  using Form = std::shared_ptr<platform::Dictionary>;
+
+  // `flags` are the request's discovery flags; `transaction` adds each
+  // kept form's annotations.
+  MatchResults(std::uint64_t flags, std::shared_ptr<const Transaction> transaction);
+
+  // "com.corvane.qvd.postExporting", made for this request.
+  const std::shared_ptr<platform::dispatch::SerialQueue>& postExportQueue() const {
+    return queue_;
+  }
+
+  // Merges the exported `form` of `plugIn`: applies the version-duplicate
+  // rule against the forms kept so far, then (when kept) adds the
+  // annotations and daemon-side fields and records the plug-in's
+  // replacement declarations. REQUIRES: on postExportQueue().
+  void merge(const QVDPlugIn& plugIn, const platform::Dictionary& form);
+
+  // Marks replacements ("overrider" on the replaced form, "overriding" on
+  // the replacing one) and sorts the forms by identifier, then version,
+  // then path, so that the same state always gives the same reply.
+  // REQUIRES: every merge has finished.
+  void finish();
+
+  const std::vector<Form>& matches() const { return matches_; }
+
+ private:
+  enum class Verdict { KeepBoth, DropNew, ReplaceKept };
+  // What happens to a new form of `plugIn` given a kept form of the same
+  // identifier.
+  Verdict compare(const QVDPlugIn& plugIn, const platform::Dictionary& kept) const;
+  // Whether `plugIn` wins over a kept form of the same version.
+  static bool preferred(const QVDPlugIn& plugIn, const platform::Dictionary& kept);
+  void recordReplacements(const QVDPlugIn& plugIn, const Form& form);
+
+  const std::uint64_t flags_;
+  const std::shared_ptr<const Transaction> transaction_;
+  const std::shared_ptr<platform::dispatch::SerialQueue> queue_;
+  std::vector<Form> matches_;
+  // Replaced identifier -> the form of the plug-in that replaces it.
+  std::map<std::string, Form> overrides_;
+};
+
+// The version text a plug-in's form carries: its version, or "<none>".
+std::string versionText(const QVDPlugIn& plugIn);
+
+}  // namespace qvd

@@ -1,0 +1,162 @@
+// The "match" request: discovery. Candidates come from the registry, each
+// is filtered on the request's queue, the survivors are exported in
+// parallel, and their forms are merged one at a time on a serial queue of
+// the request's own before the reply is written.
+#include <atomic>
+#include <string>
+#include <utility>
+#include <vector>
+
+#include "Quorvex/QVDConstants.h"
+#include "Quorvex/QVDaemonClient.h"
+#include "Quorvex/QVErrors.h"
+#include "Quorvex/QVLog.h"
+#include "Quorvex/QVPlugInConstants.h"
+#include "platform/dispatch/ConcurrentQueue.h"
+#include "platform/dispatch/Group.h"
+#include "platform/dispatch/ScopedBlockingCall.h"
+#include "qvd/HostRelativeDuplicates.h"
+#include "qvd/MatchResults.h"
+#include "qvd/QVDMbxClient.h"
+#include "qvd/QVDProbes.h"
+#include "qvd/QVDServer.h"
+#include "qvd/Transaction.h"
+#include "qvd/WireValues.h"
+
+namespace qvd {
+
+namespace {
+
+std::string uuidText(const QVDPlugIn& plugIn) {
+  const std::optional<platform::Uuid> uuid = plugIn.uuid();
+  return uuid ? uuid->toString() : std::string("(none)");
+}
+
+void logCandidates(const std::vector<std::shared_ptr<QVDPlugIn>>& candidates) {
+  if (candidates.empty()) {
+    QVLogOps().info("Candidate plugin count: 0");
+    return;
+  }
+  if (!QVLogOps().isEnabled(platform::log::Level::Info)) return;
+  platform::Array info;
+  for (const auto& p : candidates) {
+    info.append(p->identifier().value_or("") + "(" + versionText(*p) + ") " + uuidText(*p));
+  }
+  QVLogOps().info("Candidate plugin count: %u, info: %{public}@",
+                  static_cast<unsigned>(candidates.size()), platform::Value(std::move(info)));
+}
+
+}  // namespace
+
+void Transaction::matchPlugIns() {
+  const platform::Value& rulesValue = request_.get(QVDRulesKey);
+  std::optional<platform::Dictionary> rules;
+  if (!rulesValue.isNone()) {
+    const platform::Dictionary* given = rulesValue.dictionary();
+    if (given == nullptr) {
+      failMessage(QVErrorInvalidRequest, "invalid request format (bad rules dictionary)");
+      return;
+    }
+    rules = *given;
+  }
+  const std::uint64_t flags = wire::uint64(request_.get(QVDFlagsKey)).value_or(0);
+  const bool all = (flags & QVDiscoverAll) != 0;
+  if (all && (!client_->hasEntitlement(QVManagerEntitlement) || client_->isSandboxed())) {
+    failMessage(QVErrorDenied, "unauthorized discovery flag (QVDiscoverAll)");
+    return;
+  }
+
+  auto results = std::make_shared<MatchResults>(flags, shared_from_this());
+  const std::shared_ptr<platform::dispatch::Group> exports = platform::dispatch::Group::create();
+  const std::vector<platform::Dictionary> exclusions = server()->userPrefs().exclusionRuleSets();
+
+  std::vector<std::shared_ptr<QVDPlugIn>> candidates;
+  if (std::optional<QVDPlugInSet> found = server()->findPlugIns(rules)) {
+    candidates.assign(found->begin(), found->end());
+  }
+  probes::discoverRaw(static_cast<unsigned>(candidates.size()));
+  logCandidates(candidates);
+  removeHostRelativeDuplicates(candidates, connection());
+
+  const int pid = client_->pid();
+  const std::optional<std::string> hostPlugIns =
+      client_->bundle() ? client_->bundle()->plugInsPath() : std::nullopt;
+  const auto exportQueue =
+      platform::dispatch::ConcurrentQueue::shared(platform::dispatch::Priority::UserInitiated);
+  for (const std::shared_ptr<QVDPlugIn>& p : candidates) {
+    if (!all) {
+      if (!p->onSystemVolume()) {
+        // Off the system volume a plug-in must belong to an application.
+        if (!p->containingUrl()) continue;
+        if (flags & QVDiscoverSystemOnly) continue;
+      }
+      if (p->isDedicated()) {
+        const std::string path = p->path().value_or("");
+        if (!hostPlugIns || path.compare(0, hostPlugIns->size(), *hostPlugIns) != 0) continue;
+      }
+      if (server()->holdOnPlugIn(*p)) continue;
+    }
+    if (!p->match(rules)) continue;
+    bool excluded = false;
+    for (const platform::Dictionary& exclusion : exclusions) {
+      if (p->match(exclusion)) {
+        QVLogOps().info("client %d plugin %{public}@ globally excluded", pid, uuidText(*p));
+        excluded = true;
+        break;
+      }
+    }
+    if (excluded) continue;
+    if (!all) {
+      if (std::optional<std::string> reason = p->allowForClient(*client_)) {
+        QVLogOps().info("client %d cannot use plugin %{public}@: %{public}@", pid, uuidText(*p),
+                        *reason);
+        continue;
+      }
+    }
+    // Left by the merge, or here when there is nothing to merge.
+    exports->enter();
+    exportQueue->async([p, results, exports] {
+      std::optional<platform::Error> error;
+      std::optional<platform::Dictionary> form = p->exportForm(&error);
+      if (!form) {
+        QVLogOps().error("failed to export matching plug-in %{public}@: %{public}@", uuidText(*p),
+                         error ? error->description() : std::string("unknown error"));
+        exports->leave();
+        return;
+      }
+      results->postExportQueue()->async([p, results, exports, form = std::move(*form)] {
+        results->merge(*p, form);
+        exports->leave();
+      });
+    });
+  }
+  {
+    // Exports and merges run on other queues; the pool may add a thread
+    // while this one waits.
+    platform::dispatch::ScopedBlockingCall blocking;
+    exports->wait();
+  }
+
+  results->finish();
+  platform::Array matches;
+  platform::Array uuids;
+  for (const MatchResults::Form& form : results->matches()) {
+    uuids.append(form->get(QVFormUUIDKey));
+    matches.append(*form);
+  }
+  if (matches.empty()) {
+    QVLogOps().info("Resulting plugin count: 0");
+  } else {
+    QVLogOps().info("Resulting plugin count: %u, UUIDs: %{public}@",
+                    static_cast<unsigned>(matches.size()), platform::Value(std::move(uuids)));
+  }
+  platform::Value converted = QVDaemonClient::convertToMBX(platform::Value(std::move(matches)),
+                                                           version());
+  // A version-2 request gets no forms: their whole-value encoding is not
+  // defined for it, and the request still succeeds.
+  if (!converted.isNone()) reply().set(QVDMatchesKey, std::move(converted));
+  QVLogOps().debug("reply marshalled");
+  done();
+}
+
+}  // namespace qvd
