@@ -2,7 +2,9 @@
 // is filtered on the request's queue, the survivors are exported in
 // parallel, and their forms are merged one at a time on a serial queue of
 // the request's own before the reply is written.
+#include <algorithm>
 #include <atomic>
+#include <thread>
 #include <string>
 #include <utility>
 #include <vector>
@@ -15,6 +17,7 @@
 #include "platform/dispatch/ConcurrentQueue.h"
 #include "platform/dispatch/Group.h"
 #include "platform/dispatch/ScopedBlockingCall.h"
+#include "platform/dispatch/Semaphore.h"
 #include "qvd/HostRelativeDuplicates.h"
 #include "qvd/MatchResults.h"
 #include "qvd/QVDMbxClient.h"
@@ -83,6 +86,8 @@ void Transaction::matchPlugIns() {
       client_->bundle() ? client_->bundle()->plugInsPath() : std::nullopt;
   const auto exportQueue =
       platform::dispatch::ConcurrentQueue::shared(platform::dispatch::Priority::UserInitiated);
+  const auto exportSlots = std::make_shared<platform::dispatch::Semaphore>(
+      static_cast<std::int64_t>(std::max(2u, 4 * std::thread::hardware_concurrency())));
   for (const std::shared_ptr<QVDPlugIn>& p : candidates) {
     if (!all) {
       if (!p->onSystemVolume()) {
@@ -113,11 +118,20 @@ void Transaction::matchPlugIns() {
         continue;
       }
     }
+    // Exports wait on the registry's and the database's queues, which need
+    // pool threads of their own: with thousands in flight at once, every
+    // pool thread would wait on work that no thread is left to run. A few
+    // per core keep both cores busy.
+    {
+      platform::dispatch::ScopedBlockingCall blocking;
+      exportSlots->wait();
+    }
     // Left by the merge, or here when there is nothing to merge.
     exports->enter();
-    exportQueue->async([p, results, exports] {
+    exportQueue->async([p, results, exports, exportSlots] {
       std::optional<platform::Error> error;
       std::optional<platform::Dictionary> form = p->exportForm(&error);
+      exportSlots->signal();
       if (!form) {
         QVLogOps().error("failed to export matching plug-in %{public}@: %{public}@", uuidText(*p),
                          error ? error->description() : std::string("unknown error"));

@@ -38,7 +38,11 @@ long matchOnce(QVDaemonClient& client, const Dictionary& rules) {
     if (!reply.ok()) {
       std::fprintf(stderr, "match: %s\n", reply.error().description().c_str());
     } else if (auto error = QVDaemonClient::errorInReply(reply)) {
-      std::fprintf(stderr, "match: %s\n", error->description().c_str());
+      forms = -2;  // the daemon answered with an error
+      if (error->description().find("reply too large") == std::string::npos) {
+        std::fprintf(stderr, "match: %s\n", error->description().c_str());
+        forms = -1;
+      }
     } else {
       const platform::Dictionary* body = reply->dictionary();
       const platform::Array* matches = body ? body->get(QVDMatchesKey).array() : nullptr;
@@ -56,6 +60,7 @@ struct Figures {
   double point = 0;
   double version = 0;
   long residentAfter = -1;
+  bool tooLarge = false;  // all forms exceed one message: answered with an error
 };
 
 bool measure(const std::string& qvd, const std::string& base, std::size_t plugIns, Figures& out) {
@@ -79,17 +84,21 @@ bool measure(const std::string& qvd, const std::string& base, std::size_t plugIn
   const Dictionary version{{"XOExtensionVersion", ">=1.0"}};
   long forms = 0;
   out.firstAll = secondsOf([&] { forms = matchOnce(**client, none); });
-  if (forms != static_cast<long>(plugIns)) {
+  // Every form of 10,000 plug-ins is more than one message may carry (16
+  // MiB): the daemon answers with an error, which is timed all the same.
+  out.tooLarge = forms == -2;
+  const long wanted = out.tooLarge ? -2 : static_cast<long>(plugIns);
+  if (forms != wanted) {
     std::fprintf(stderr, "match without rules gave %ld forms of %zu\n", forms, plugIns);
     return false;
   }
-  const int rounds = plugIns >= 10'000 ? 7 : 21;
+  const int rounds = plugIns >= 10'000 ? 3 : 15;
   std::vector<double> all, one, versions;
   for (int i = 0; i < rounds; ++i) {
     all.push_back(secondsOf([&] { forms = matchOnce(**client, none); }));
-    if (forms != static_cast<long>(plugIns)) return false;
+    if (forms != wanted) return false;
     versions.push_back(secondsOf([&] { forms = matchOnce(**client, version); }));
-    if (forms != static_cast<long>(plugIns)) return false;
+    if (forms != wanted) return false;
     for (int j = 0; j < 10; ++j) {
       one.push_back(secondsOf([&] { forms = matchOnce(**client, point); }));
       if (forms != static_cast<long>(kPerPoint)) {
@@ -119,15 +128,19 @@ int main() {
       break;
     }
   }
+  if (!ok) {
+    std::fprintf(stderr, "kept %s for a look (each root has its qvd.log)\n", base.c_str());
+    return 1;
+  }
   std::error_code ignored;
   std::filesystem::remove_all(base, ignored);
-  if (!ok) return 1;
 
   bench::registry::Table table;
   table.section("match through QVDaemonClient (medians; 50 plug-ins per extension point)");
   for (const auto& [n, f] : figures) {
     table.add("no rules, " + grouped(n) + ", first (creates the plug-ins)", millis(f.firstAll));
     table.add("no rules, " + grouped(n), millis(f.all),
+              f.tooLarge ? "refused: the forms exceed one 16 MiB message" :
               n == 1'000 ? (f.all < 0.050 ? "target < 50 ms: met" : "target < 50 ms: MISSED")
                          : "");
     table.add("one extension point (50 of " + grouped(n) + ")", millis(f.point),
