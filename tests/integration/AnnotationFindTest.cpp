@@ -257,19 +257,6 @@ TEST_F(AnnotationFindTest, FindByPathOrUuidWithWireTypesAndVersions) {
       << "a version-2 request succeeds without a form";
 }
 
-TEST_F(AnnotationFindTest, FindIgnoresExclusionsAndElection) {
-  writeVmapFile(root_ / "etc/quorvex/preferences/com.corvane.quorvex.userprefs.vmap",
-                Dictionary{{"exclusions", Array{"com.example.alpha", "com.example.beta"}}});
-  const Uuid beta = uuidOf("beta");
-  ASSERT_EQ(errorOf(send(request(QVDAnnotateRequest,
-                                 {{std::string(QVDUUIDKey), Array{beta}},
-                                  {std::string(QVDAnnotationsKey), Dictionary{{"election", -1}}}}))),
-            kSuccess);
-  for (const char* name : {"alpha", "beta"}) {
-    EXPECT_EQ(formAt(paths_[name]).get(QVFormIdentifierKey), Value(std::string("com.example.") + name));
-  }
-}
-
 TEST_F(AnnotationFindTest, QvctlToursAnnotateBulkAndFind) {
   const std::string alpha = uuidOf("alpha").toString();
   Finished annotated = runQvctl(root_, {"annotate", alpha, "--election", "1"});

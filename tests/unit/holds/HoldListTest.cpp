@@ -66,24 +66,6 @@ TEST_F(HoldListTest, HoldOnPlugInGoesByIdentityAndReleaseByTokenPostsOnlyWhenFou
                                                " at client's request"));
 }
 
-TEST_F(HoldListTest, ADeadClientLosesEveryHoldWithOneNotificationEach) {
-  TestClient leaving(server_);
-  ASSERT_TRUE(leaving.call(request("nope")).ok());
-  TestClient staying(server_);
-  ASSERT_TRUE(staying.call(request("nope")).ok());
-  const auto clients = server_.clients();
-  ASSERT_EQ(clients.size(), 2u);
-  const std::uint64_t before = posts();
-  for (int i = 0; i < 3; ++i) hold({}, clients[0]);
-  const auto kept = hold({}, clients[1]);
-  EXPECT_EQ(posts(), before + 4);
-
-  leaving.cancel();
-  ASSERT_TRUE(eventually([&] { return server_.server()->holds().size() == 1; }));
-  EXPECT_EQ(server_.server()->holds().front(), kept);
-  EXPECT_EQ(posts(), before + 7);
-}
-
 TEST_F(HoldListTest, EachHoldKeepsTheDaemonAliveUntilItIsReleased) {
   const std::size_t baseline = platform::mbx::activeTransactionCount();
   const Uuid first = hold({})->uuid();
@@ -140,15 +122,6 @@ TEST_F(HoldListTest, TerminationCompletesOnceOnlyAfterEveryAnswer) {
                                   std::to_string(EIO) + " for uuid=" + failing.uuid.toString()));
   EXPECT_TRUE(contains(lines, "waiting for 3 termination replies"));
   EXPECT_TRUE(contains(lines, "awaiting termination reply #2"));
-}
-
-TEST_F(HoldListTest, TerminatingNothingCompletesOnce) {
-  std::atomic<int> completions{0};
-  server_.server()->terminatePlugInsReply({}, [&] { ++completions; });
-  ASSERT_TRUE(eventually([&] { return completions == 1; }));
-  std::this_thread::sleep_for(20ms);
-  EXPECT_EQ(completions, 1);
-  EXPECT_TRUE(server_.fakes().serviceManager->removals().empty());
 }
 
 TEST_F(HoldListTest, AnUninstalledPlugInLeavesTheCacheAndIsTerminated) {

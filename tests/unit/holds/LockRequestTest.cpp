@@ -122,25 +122,5 @@ TEST_F(LockRequestTest, OnlyARefusingHoldAsksWhoIsBusyAndAnIncompleteInstanceIsN
   EXPECT_TRUE(logged);
 }
 
-TEST_F(LockRequestTest, ForcedTerminationDefersTheReplyWhileTheHoldIsInForce) {
-  const auto a = put("a", "3");
-  const auto b = put("b");
-  auto& lumend = *server_.fakes().serviceManager;
-  lumend.holdReplies();
-  client_.callAsync(lock(0x1 | 0x4, {a.path, b.path}));
-  ASSERT_TRUE(eventually([&] { return lumend.removals().size() == 2; }));
-  EXPECT_EQ(lumend.removals()[0].bundleIdentifier, "com.example.a");
-  EXPECT_EQ(lumend.removals()[0].version, "3");
-  EXPECT_TRUE(held(a));
-  EXPECT_TRUE(held(b));
-  std::this_thread::sleep_for(50ms);
-  EXPECT_EQ(client_.asyncReplyCount(), 0u) << "the reply waits for the service manager";
-
-  // Other requests are served meanwhile: the service queue is not blocked.
-  EXPECT_EQ(errorOf(send(request("nope"))), (ErrorReply{4, "unrecognized request"}));
-  lumend.releaseReplies();
-  EXPECT_TRUE(eventually([&] { return client_.asyncReplyCount() == 1; }));
-}
-
 }  // namespace
 }  // namespace qvd::testing
