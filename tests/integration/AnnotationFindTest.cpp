@@ -30,14 +30,6 @@ Dictionary request(std::string_view name, Dictionary keys = {}) {
   return keys;
 }
 
-std::pair<std::uint64_t, std::string> errorOf(const Value& reply) {
-  const Dictionary* body = reply.dictionary();
-  if (body == nullptr) return {~0ull, "no reply"};
-  const std::string* text = body->get(QVDErrorKey).string();
-  return {body->get(QVDErrorCodeKey).uint64().value_or(0), text ? *text : ""};
-}
-
-const std::pair<std::uint64_t, std::string> kSuccess{0, ""};
 
 class AnnotationFindTest : public ::testing::Test {
  protected:

@@ -10,6 +10,7 @@
 #include "Quorvex/QVDConstants.h"
 #include "platform/values/Dictionary.h"
 #include "tests/integration/DaemonHarness.h"
+#include "tests/integration/RootContents.h"
 
 namespace qvd::integration {
 namespace {
@@ -24,13 +25,6 @@ Dictionary request(Value name, Value version = Value(3)) {
   d.set(QVDRequestKey, std::move(name));
   d.set(QVDVersionKey, std::move(version));
   return d;
-}
-
-std::pair<std::uint64_t, std::string> errorOf(const Value& reply) {
-  const Dictionary* body = reply.dictionary();
-  if (body == nullptr) return {~0ull, "no reply"};
-  const std::string* text = body->get(QVDErrorKey).string();
-  return {body->get(QVDErrorCodeKey).uint64().value_or(0), text ? *text : ""};
 }
 
 TEST(DaemonCommandLineTest, UsageErrorsAndConstructionFailure) {

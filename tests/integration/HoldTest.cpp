@@ -53,13 +53,6 @@ Dictionary lockRequest(std::uint64_t flags, const std::vector<std::string>& path
                     {std::string(QVDPathsKey), std::move(list)}};
 }
 
-std::pair<std::uint64_t, std::string> errorOf(const Value& reply) {
-  const Dictionary* body = reply.dictionary();
-  if (body == nullptr) return {~0ull, "no reply"};
-  const std::string* text = body->get(QVDErrorKey).string();
-  return {body->get(QVDErrorCodeKey).uint64().value_or(0), text ? *text : ""};
-}
-const std::pair<std::uint64_t, std::string> kSuccess{0, ""};
 
 Uuid tokenOf(const Value& reply) {
   const Dictionary* body = reply.dictionary();

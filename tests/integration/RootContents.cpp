@@ -3,6 +3,7 @@
 #include <cstdio>
 #include <filesystem>
 
+#include "Quorvex/QVDConstants.h"
 #include "platform/notify/LinuxNotificationCenter.h"
 #include "platform/vmap/AtomicFile.h"
 #include "platform/vmap/Reader.h"
@@ -43,6 +44,13 @@ std::uint64_t postCount(const TemporaryRoot& root, const std::string& name) {
   platform::notify::LinuxNotificationCenter center(root / "run/quorvex/notify");
   auto count = center.currentCount(name);
   return count.ok() ? *count : ~0ull;
+}
+
+std::pair<std::uint64_t, std::string> errorOf(const Value& reply) {
+  const Dictionary* body = reply.dictionary();
+  if (body == nullptr) return {~0ull, "no reply"};
+  const std::string* text = body->get(QVDErrorKey).string();
+  return {body->get(QVDErrorCodeKey).uint64().value_or(0), text ? *text : ""};
 }
 
 Finished runQvctl(const TemporaryRoot& root, std::vector<std::string> arguments,

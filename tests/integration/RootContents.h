@@ -4,6 +4,7 @@
 
 #include <cstdint>
 #include <string>
+#include <utility>
 
 #include "platform/values/Dictionary.h"
 #include "platform/values/Value.h"
@@ -26,6 +27,11 @@ platform::Value readVmapFile(const std::string& path);
 // How often `name` has been posted under the root, read through the notify
 // layer; 0 before the first post.
 std::uint64_t postCount(const TemporaryRoot& root, const std::string& name);
+
+// The "errorcode" and "error" of a reply: {0, ""} for a success, {~0, "no
+// reply"} when there is no dictionary.
+std::pair<std::uint64_t, std::string> errorOf(const platform::Value& reply);
+inline const std::pair<std::uint64_t, std::string> kSuccess{0, ""};
 
 // Runs qvctl on the root (with --service `service` when not empty).
 Finished runQvctl(const TemporaryRoot& root, std::vector<std::string> arguments,
