@@ -62,7 +62,7 @@ Value QVDaemonClient::convertToMBX(const Value& value, std::uint64_t version) {
   if (version != QVDProtocolVersion) return Value();
   // The codec is the judge of what can travel: a none nested anywhere, or
   // text that is not UTF-8, would only fail later, when sending.
-  if (value.isNone() || !platform::cbor::encode(value).ok()) return Value();
+  if (value.isNone() || !platform::cbor::checkEncodable(value).ok()) return Value();
   return value;
 }
 

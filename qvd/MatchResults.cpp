@@ -13,9 +13,9 @@ namespace qvd {
 
 namespace {
 
-std::string textOf(const platform::Dictionary& form, std::string_view key) {
+std::string_view textOf(const platform::Dictionary& form, std::string_view key) {
   const std::string* text = form.get(key).string();
-  return text ? *text : std::string();
+  return text ? std::string_view(*text) : std::string_view();
 }
 
 }  // namespace
@@ -55,21 +55,22 @@ MatchResults::Verdict MatchResults::compare(const QVDPlugIn& plugIn,
   return order == QVOrdering::Descending ? Verdict::ReplaceKept : Verdict::DropNew;
 }
 
-void MatchResults::merge(const QVDPlugIn& plugIn, const platform::Dictionary& form) {
+void MatchResults::merge(const QVDPlugIn& plugIn, platform::Dictionary form) {
   QV_ASSERT_ON_QUEUE(queue_);
-  const std::string identifier = plugIn.identifier().value_or("");
-  for (auto kept = matches_.begin(); kept != matches_.end(); ++kept) {
-    if (textOf(**kept, QVFormIdentifierKey) != identifier) continue;
+  std::vector<Form>& same = kept_[plugIn.identifier().value_or("")];
+  for (auto kept = same.begin(); kept != same.end(); ++kept) {
     const Verdict verdict = compare(plugIn, **kept);
     if (verdict == Verdict::KeepBoth) continue;
     if (verdict == Verdict::DropNew) return;
-    matches_.erase(kept);
+    same.erase(kept);
+    --keptCount_;
     break;
   }
-  auto merged = std::make_shared<platform::Dictionary>(form);
+  auto merged = std::make_shared<platform::Dictionary>(std::move(form));
   transaction_->addAnnotationForPlugIn(plugIn, *merged);
   plugIn.augmentForm(*merged);
-  matches_.push_back(merged);
+  same.push_back(merged);
+  ++keptCount_;
   recordReplacements(plugIn, merged);
 }
 
@@ -85,9 +86,14 @@ void MatchResults::recordReplacements(const QVDPlugIn& plugIn, const Form& form)
 }
 
 void MatchResults::finish() {
+  matches_.reserve(keptCount_);
+  for (auto& [identifier, forms] : kept_) {
+    for (Form& form : forms) matches_.push_back(std::move(form));
+  }
+  kept_.clear();
   if (!overrides_.empty()) {
     for (const Form& replaced : matches_) {
-      auto found = overrides_.find(textOf(*replaced, QVFormIdentifierKey));
+      auto found = overrides_.find(std::string(textOf(*replaced, QVFormIdentifierKey)));
       if (found == overrides_.end()) continue;
       const Form& replacing = found->second;
       // Read before writing: a plug-in that names its own identifier is
@@ -101,11 +107,10 @@ void MatchResults::finish() {
     }
   }
   std::stable_sort(matches_.begin(), matches_.end(), [](const Form& a, const Form& b) {
-    const std::string aId = textOf(*a, QVFormIdentifierKey);
-    const std::string bId = textOf(*b, QVFormIdentifierKey);
+    const std::string_view aId = textOf(*a, QVFormIdentifierKey);
+    const std::string_view bId = textOf(*b, QVFormIdentifierKey);
     if (aId != bId) return aId < bId;
-    const QVOrdering order =
-        compareVersionString(textOf(*a, QVFormVersionKey), textOf(*b, QVFormVersionKey));
+    const QVOrdering order = compareVersionString(textOf(*a, QVFormVersionKey), textOf(*b, QVFormVersionKey));
     if (order != QVOrdering::Same) return order == QVOrdering::Ascending;
     return textOf(*a, QVFormPathKey) < textOf(*b, QVFormPathKey);
   });

@@ -69,18 +69,25 @@ int QVDMbxClient::pid() const {
   return task_ ? static_cast<int>(task_->pid()) : 0;
 }
 
-platform::Value QVDMbxClient::entitlementValueForKey(std::string_view key) const {
+platform::Dictionary QVDMbxClient::entitlements() const {
   auto entitlements = server_->platform().entitlements->entitlementsOfExecutable(path_);
   if (!entitlements.ok()) {
     QVLogOps().error("error retrieving entitlements for client %d", pid());
     QVLogOps().debug("entitlements of %s: %@", path_, entitlements.error());
-    return platform::Value();
+    return platform::Dictionary();
   }
-  return entitlements->get(key);
+  return std::move(entitlements).value();
+}
+
+platform::Value QVDMbxClient::entitlementValueForKey(std::string_view key) const {
+  return entitlements().get(key);
 }
 
 bool QVDMbxClient::hasEntitlement(std::string_view key) const {
-  platform::Value value = entitlementValueForKey(key);
+  return entitlementGranted(entitlementValueForKey(key));
+}
+
+bool entitlementGranted(const platform::Value& value) {
   if (value.isNone()) return false;
   // Property-list equality: false == 0, so both withhold the entitlement.
   return !(value == platform::Value(false));

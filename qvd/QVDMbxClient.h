@@ -51,6 +51,10 @@ class QVDMbxClient : public std::enable_shared_from_this<QVDMbxClient> {
   platform::Value entitlementValueForKey(std::string_view key) const;
   // True when the entitlement is present and neither false nor 0.
   bool hasEntitlement(std::string_view key) const;
+  // Every entitlement of the peer's executable as the grants stand now
+  // (empty when they cannot be read, which is logged). A request that asks
+  // about many plug-ins reads them once: each lookup re-reads the grants.
+  platform::Dictionary entitlements() const;
   // True when the peer runs confined beyond the daemon.
   bool isSandboxed() const;
 
@@ -92,5 +96,8 @@ class QVDMbxClient : public std::enable_shared_from_this<QVDMbxClient> {
   std::atomic<int> syncOutstanding_{0};
   std::atomic<bool> deathPending_{false};
 };
+
+// Whether an entitlement value grants it: present and neither false nor 0.
+bool entitlementGranted(const platform::Value& value);
 
 }  // namespace qvd

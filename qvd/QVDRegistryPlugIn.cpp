@@ -91,7 +91,21 @@ std::shared_ptr<QVDPlugIn> QVDPlugIn::initWithHVData(const PlugInRecord& record,
   return plugIn;
 }
 
+void QVDPlugIn::lendRecord(const platform::Uuid& generation,
+                           const std::shared_ptr<const PlugInRecord>& record) const {
+  std::lock_guard<std::mutex> hold(lentLock_);
+  lentGeneration_ = generation;
+  lent_ = record;
+}
+
 std::optional<PlugInRecord> QVDPlugIn::getProxy() const {
+  {
+    const platform::Uuid generation = services_.registry->generation();
+    std::lock_guard<std::mutex> hold(lentLock_);
+    if (lentGeneration_ == generation) {
+      if (std::shared_ptr<const PlugInRecord> record = lent_.lock()) return *record;
+    }
+  }
   const std::optional<platform::Uuid> id = uuid();
   if (id) {
     if (std::optional<PlugInRecord> found =

@@ -68,8 +68,16 @@ class QVDPlugIn final : public QVPlugInCore, public QVDAnnotated {
   static std::shared_ptr<QVDPlugIn> initWithHVData(const platform::holvane::PlugInRecord& record,
                                                    Services services);
 
-  // A current registration record of this plug-in: by UUID, else by path.
+  // A current registration record of this plug-in: the lent one while it
+  // is current, else by UUID, else by path.
   std::optional<platform::holvane::PlugInRecord> getProxy() const;
+  // Lends `record`, read from the registry at `generation` or later. It is
+  // held weakly: the lender decides how long it lives, and getProxy uses it
+  // only while the registry is still at `generation`. A request about
+  // thousands of plug-ins lends the records its query just read, so that
+  // their exports do not read each one again.
+  void lendRecord(const platform::Uuid& generation,
+                  const std::shared_ptr<const platform::holvane::PlugInRecord>& record) const;
 
   // Entries stay in the daemon's cache until a purge or an uninstall.
   bool isStillValid() const { return true; }
@@ -165,6 +173,9 @@ class QVDPlugIn final : public QVPlugInCore, public QVDAnnotated {
   // plug-in matches (when present), and the host must hold the entitlement
   // the plug-in names in "XOExtensionHostEntitlement" (when present).
   std::optional<std::string> allowForClient(const QVDMbxClient& client) const;
+  // The same, given the host's entitlements as read once for a request that
+  // asks about many plug-ins.
+  std::optional<std::string> allowForClient(const platform::Dictionary& hostEntitlements) const;
 
   // ---- Busy (QVDRegistryPlugInBusy.cpp) ----
 
@@ -200,6 +211,10 @@ class QVDPlugIn final : public QVPlugInCore, public QVDAnnotated {
   mutable QVAtomicField<platform::Dictionary> infoVmap_;
   mutable QVAtomicField<platform::Uuid> hvKnowledgeUUID_;
   mutable std::recursive_mutex lock_;
+  // The lent record and the generation it is current at.
+  mutable std::mutex lentLock_;
+  mutable platform::Uuid lentGeneration_;
+  mutable std::weak_ptr<const platform::holvane::PlugInRecord> lent_;
 };
 
 }  // namespace qvd

@@ -11,7 +11,12 @@
 namespace qvd {
 
 std::optional<std::string> QVDPlugIn::allowForClient(const QVDMbxClient& client) const {
-  const platform::Value restriction = client.entitlementValueForKey(QVAllowedPlugInsEntitlement);
+  return allowForClient(client.entitlements());
+}
+
+std::optional<std::string> QVDPlugIn::allowForClient(
+    const platform::Dictionary& hostEntitlements) const {
+  const platform::Value& restriction = hostEntitlements.get(QVAllowedPlugInsEntitlement);
   if (!restriction.isNone()) {
     const platform::Dictionary* rules = restriction.dictionary();
     // A restriction that cannot be read restricts to nothing rather than
@@ -26,7 +31,7 @@ std::optional<std::string> QVDPlugIn::allowForClient(const QVDMbxClient& client)
     // An entitlement is named by a string; a demand of another kind names
     // none a host could hold, so no host satisfies it.
     const std::string* name = demanded.string();
-    if (name == nullptr || !client.hasEntitlement(*name)) {
+    if (name == nullptr || !entitlementGranted(hostEntitlements.get(*name))) {
       return "the host does not have the \"" + (name ? *name : demanded.description()) +
              "\" entitlement";
     }

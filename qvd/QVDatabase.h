@@ -41,6 +41,7 @@
 namespace qvd {
 
 // Plug-ins as a set: members are equal when their UUIDs are.
+using QVDLentRecords = std::vector<std::shared_ptr<const platform::holvane::PlugInRecord>>;
 using QVDPlugInSet =
     std::unordered_set<std::shared_ptr<QVDPlugIn>, QVPlugInCoreHash, QVPlugInCoreEqual>;
 
@@ -100,8 +101,13 @@ class QVDatabase {
   // The plug-ins the registration service selects for `query`, narrowed by
   // the user's elections when the query's "XOUserElection" asks for it.
   // An absent or empty query lists every plug-in, ignoring elections.
-  // None when the service answered no list.
-  std::optional<QVDPlugInSet> findPlugIns(const std::optional<platform::Dictionary>& query);
+  // None when the service answered no list. When `lent` is given, it
+  // receives the registration records the plug-ins were found with, and
+  // each plug-in borrows its own (QVDPlugIn::lendRecord): while the caller
+  // keeps them and the registration database stays unchanged, the plug-ins
+  // read these rather than fetching their records again.
+  std::optional<QVDPlugInSet> findPlugIns(const std::optional<platform::Dictionary>& query,
+                                          QVDLentRecords* lent = nullptr);
   // The plug-in with `uuid`, or none.
   virtual std::shared_ptr<QVDPlugIn> findPlugIn(const platform::Uuid& uuid);
   // The plug-in whose bundle lies at the file URL `url`, or none.

@@ -160,8 +160,10 @@ std::string electionKey(const Value& election) {
 }
 
 std::optional<QVDPlugInSet> QVDatabase::findPlugIns(
-    const std::optional<platform::Dictionary>& query) {
+    const std::optional<platform::Dictionary>& query, QVDLentRecords* lent) {
   if (!registry_) return std::nullopt;
+  // Read before the query: its records are at least this current.
+  const platform::Uuid generation = registry_->generation();
   platform::Result<std::vector<PlugInRecord>> records = std::vector<PlugInRecord>();
   if (!query || query->empty()) {
     records = registry_->allPlugIns();
@@ -211,7 +213,7 @@ std::optional<QVDPlugInSet> QVDatabase::findPlugIns(
 
   const std::size_t before = cache_->approximateCount();
   QVDPlugInSet found;
-  for (const PlugInRecord& record : *records) {
+  for (PlugInRecord& record : *records) {
     if (record.path.empty()) {
       QVLogOps().info("skipping hv proxy %@ with nil bundleURL", record.uuid);
       continue;
@@ -228,7 +230,18 @@ std::optional<QVDPlugInSet> QVDatabase::findPlugIns(
         continue;
       }
     }
-    if (std::shared_ptr<QVDPlugIn> plugIn = plugInForProxy(record)) found.insert(std::move(plugIn));
+    if (lent == nullptr) {
+      if (std::shared_ptr<QVDPlugIn> plugIn = plugInForProxy(record)) {
+        found.insert(std::move(plugIn));
+      }
+      continue;
+    }
+    auto shared = std::make_shared<const PlugInRecord>(std::move(record));
+    if (std::shared_ptr<QVDPlugIn> plugIn = plugInForProxy(*shared)) {
+      plugIn->lendRecord(generation, shared);
+      lent->push_back(std::move(shared));
+      found.insert(std::move(plugIn));
+    }
   }
   QVLogOps().debug("HV reported %u plug-ins (cache %u/%u)", found.size(), before,
                    cache_->approximateCount());

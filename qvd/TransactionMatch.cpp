@@ -74,7 +74,10 @@ void Transaction::matchPlugIns() {
   const std::vector<platform::Dictionary> exclusions = server()->userPrefs().exclusionRuleSets();
 
   std::vector<std::shared_ptr<QVDPlugIn>> candidates;
-  if (std::optional<QVDPlugInSet> found = server()->findPlugIns(rules)) {
+  // Kept until every export has finished: the exports read these records
+  // instead of fetching their own.
+  QVDLentRecords records;
+  if (std::optional<QVDPlugInSet> found = server()->findPlugIns(rules, &records)) {
     candidates.assign(found->begin(), found->end());
   }
   probes::discoverRaw(static_cast<unsigned>(candidates.size()));
@@ -82,6 +85,10 @@ void Transaction::matchPlugIns() {
   removeHostRelativeDuplicates(candidates, connection());
 
   const int pid = client_->pid();
+  // Read once: every lookup re-reads the grants, and the host's do not
+  // change in the middle of its request.
+  const platform::Dictionary hostEntitlements = all ? platform::Dictionary()
+                                                    : client_->entitlements();
   const std::optional<std::string> hostPlugIns =
       client_->bundle() ? client_->bundle()->plugInsPath() : std::nullopt;
   const auto exportQueue =
@@ -112,7 +119,7 @@ void Transaction::matchPlugIns() {
     }
     if (excluded) continue;
     if (!all) {
-      if (std::optional<std::string> reason = p->allowForClient(*client_)) {
+      if (std::optional<std::string> reason = p->allowForClient(hostEntitlements)) {
         QVLogOps().info("client %d cannot use plugin %{public}@: %{public}@", pid, uuidText(*p),
                         *reason);
         continue;
@@ -138,8 +145,8 @@ void Transaction::matchPlugIns() {
         exports->leave();
         return;
       }
-      results->postExportQueue()->async([p, results, exports, form = std::move(*form)] {
-        results->merge(*p, form);
+      results->postExportQueue()->async([p, results, exports, form = std::move(*form)]() mutable {
+        results->merge(*p, std::move(form));
         exports->leave();
       });
     });

@@ -6,10 +6,12 @@
 #include <stdlib.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cstdio>
 #include <filesystem>
 #include <map>
 #include <string>
+#include <vector>
 
 #include "Quorvex/QVDConstants.h"
 #include "Quorvex/QVDaemonClient.h"
@@ -114,12 +116,46 @@ bool measure(const std::string& qvd, const std::string& base, std::size_t plugIn
   return true;
 }
 
+// For a profiler: a daemon on a root of `plugIns`, asked `rounds` times for
+// every form and then for one extension point's, with its pid printed first
+// so that `perf record -p` can attach.
+int profile(const std::string& qvd, const std::string& base, std::size_t plugIns, int rounds) {
+  auto root = bench::registry::SyntheticRoot::make(base + "/profile", plugIns,
+                                                   std::max<std::size_t>(1, plugIns / kPerPoint));
+  if (!root.ok()) return 1;
+  auto daemon = bench::match::DaemonProcess::start(qvd, root->path());
+  if (!daemon.ok()) return 1;
+  platform::setRootDirectoryForTesting(root->path());
+  auto client = QVDaemonClient::initWithServiceName(std::string(QVDServiceName));
+  if (!client.ok()) return 1;
+  const Dictionary none;
+  const Dictionary point{{"XOExtensionPointName", bench::registry::SyntheticRoot::pointName(1)}};
+  matchOnce(**client, none);
+  std::printf("qvd pid %d\n", static_cast<int>(daemon->pid()));
+  std::fflush(stdout);
+  std::vector<double> all, one;
+  for (int i = 0; i < rounds; ++i) all.push_back(secondsOf([&] { matchOnce(**client, none); }));
+  for (int i = 0; i < rounds; ++i) one.push_back(secondsOf([&] { matchOnce(**client, point); }));
+  std::printf("no rules %.3f ms, one extension point %.3f ms (medians of %d)\n",
+              median(all) * 1e3, median(one) * 1e3, rounds);
+  return 0;
+}
+
 }  // namespace
 
-int main() {
+// bench_match                      the table
+// bench_match --profile N ROUNDS   one root of N plug-ins, for a profiler
+int main(int argc, char** argv) {
   const char* tmp = std::getenv("TMPDIR");
   std::string base = std::string(tmp ? tmp : "/tmp") + "/qv-match-bench-XXXXXX";
   if (::mkdtemp(base.data()) == nullptr) return 1;
+  if (argc == 4 && std::string(argv[1]) == "--profile") {
+    const int status = profile(QVD_PATH, base, std::strtoul(argv[2], nullptr, 10),
+                               static_cast<int>(std::strtol(argv[3], nullptr, 10)));
+    std::error_code ignored;
+    std::filesystem::remove_all(base, ignored);
+    return status;
+  }
   std::map<std::size_t, Figures> figures;
   bool ok = true;
   for (std::size_t n : {100, 1'000, 10'000}) {

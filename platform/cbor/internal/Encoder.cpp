@@ -19,15 +19,21 @@ std::uint8_t* Encoder::room(std::size_t size) {
 }
 
 void Encoder::writeHead(std::uint8_t major, std::uint64_t argument) {
+  if (check_) return;
   std::uint8_t* at = room(kMaxHeadSize);
   used_ -= kMaxHeadSize - internal::writeHead(major, argument, at);
 }
 
 void Encoder::writeBytes(const void* bytes, std::size_t size) {
-  if (size != 0) std::memcpy(room(size), bytes, size);
+  if (size != 0 && !check_) std::memcpy(room(size), bytes, size);
+}
+
+void Encoder::writeByte(std::uint8_t byte) {
+  if (!check_) *room(1) = byte;
 }
 
 void Encoder::writeDouble(double d) {
+  if (check_) return;
   std::uint8_t* at = room(kMaxHeadSize);
   at[0] = (kMajorSimple << 5) | kFloat64;
   storeBig64(std::bit_cast<std::uint64_t>(d), at + 1);
@@ -82,7 +88,7 @@ bool Encoder::writeValue(const Value& value) {
       writeDouble(*value.real());
       return true;
     case ValueType::Boolean:
-      *room(1) = (kMajorSimple << 5) | (*value.boolean() ? kSimpleTrue : kSimpleFalse);
+      writeByte((kMajorSimple << 5) | (*value.boolean() ? kSimpleTrue : kSimpleFalse));
       return true;
     case ValueType::Date:
       writeHead(kMajorTag, kTagEpochDate);

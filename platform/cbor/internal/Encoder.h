@@ -17,8 +17,14 @@ namespace platform::cbor::internal {
 
 class Encoder {
  public:
+  // Write produces the bytes; Check walks the value with every check of
+  // Write and produces nothing, for callers that only need to know whether
+  // a value can travel.
+  enum class Mode { Write, Check };
+
   // REQUIRES: `out` outlives the Encoder.
-  explicit Encoder(std::vector<std::uint8_t>& out) : out_(out) {}
+  explicit Encoder(std::vector<std::uint8_t>& out, Mode mode = Mode::Write)
+      : out_(out), check_(mode == Mode::Check) {}
   Encoder(const Encoder&) = delete;
   Encoder& operator=(const Encoder&) = delete;
 
@@ -40,6 +46,7 @@ class Encoder {
   void writeHead(std::uint8_t major, std::uint64_t argument);
   void writeBytes(const void* bytes, std::size_t size);
   void writeDouble(double d);
+  void writeByte(std::uint8_t byte);
   // Where the next `size` bytes go; grows out_ geometrically.
   std::uint8_t* room(std::size_t size);
   // "/rules/3/name": where the walk is, for error messages.
@@ -48,6 +55,7 @@ class Encoder {
   // out_ runs ahead of what is written (its tail is scratch space) until
   // run() trims it to used_.
   std::vector<std::uint8_t>& out_;
+  const bool check_;
   std::size_t used_ = 0;
   std::vector<Frame> stack_;
   ErrorCode failure_ = ErrorCode::kUnencodableValue;

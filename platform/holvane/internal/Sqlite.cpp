@@ -39,7 +39,10 @@ Result<std::unique_ptr<Database>> Database::open(const std::string& path) {
   return std::unique_ptr<Database>(new Database(db, path));
 }
 
-Database::~Database() { sqlite3_close(db_); }
+Database::~Database() {
+  for (auto& [sql, stmt] : cache_) sqlite3_finalize(stmt);
+  sqlite3_close(db_);
+}
 
 Status Database::exec(std::string_view sql) {
   dispatch::ScopedBlockingCall blocking;
@@ -50,6 +53,8 @@ Status Database::exec(std::string_view sql) {
 }
 
 Result<Statement> Database::prepare(std::string_view sql) {
+  const std::string text(sql);
+  if (Cache::node_type kept = cache_.extract(text)) return Statement(*this, std::move(kept));
   sqlite3_stmt* stmt = nullptr;
   const int code =
       sqlite3_prepare_v2(db_, sql.data(), static_cast<int>(sql.size()), &stmt, nullptr);
@@ -57,18 +62,30 @@ Result<Statement> Database::prepare(std::string_view sql) {
     sqlite3_finalize(stmt);
     return sqliteError(db_, code, path_);
   }
-  return Statement(*this, stmt);
+  // A fresh entry, not yet in the cache: the Statement puts it there when
+  // it is done with it.
+  Cache staging;
+  staging.emplace(text, stmt);
+  return Statement(*this, staging.extract(staging.begin()));
 }
 
 Error Database::lastError(std::string_view what) const {
   return sqliteError(db_, sqlite3_extended_errcode(db_), what);
 }
 
-Statement::Statement(Statement&& other) noexcept : db_(other.db_), stmt_(other.stmt_) {
+Statement::Statement(Statement&& other) noexcept
+    : db_(other.db_), stmt_(other.stmt_), entry_(std::move(other.entry_)) {
   other.stmt_ = nullptr;
 }
 
-Statement::~Statement() { sqlite3_finalize(stmt_); }
+Statement::~Statement() {
+  if (stmt_ == nullptr) return;
+  sqlite3_reset(stmt_);
+  sqlite3_clear_bindings(stmt_);
+  // Already there when the same text was prepared while this one was in
+  // use: the spare copy goes.
+  if (!db_->cache_.insert(std::move(entry_)).inserted) sqlite3_finalize(stmt_);
+}
 
 Status Statement::check(int code, std::string_view what) {
   if (code == SQLITE_OK) return okStatus();

@@ -13,6 +13,7 @@
 #include <span>
 #include <string>
 #include <string_view>
+#include <unordered_map>
 #include <vector>
 
 #include "platform/values/Result.h"
@@ -35,6 +36,12 @@ class Database {
 
   // Runs one or more statements that take no parameters and return no rows.
   Status exec(std::string_view sql);
+  // A statement for `sql`. Compiled statements are kept for reuse, since the
+  // registry asks the same few questions thousands of times: a statement
+  // goes back to the cache, reset, when the Statement is destroyed. A
+  // statement still in use when the same text is prepared again gets a
+  // fresh compilation. REQUIRES: `sql` comes from code, not from input, so
+  // that the cache stays small.
   Result<Statement> prepare(std::string_view sql);
   // Error for the last failed call, named by `what`.
   Error lastError(std::string_view what) const;
@@ -42,10 +49,13 @@ class Database {
   const std::string& path() const { return path_; }
 
  private:
+  using Cache = std::unordered_map<std::string, sqlite3_stmt*>;
   Database(sqlite3* db, std::string path) : db_(db), path_(std::move(path)) {}
   friend class Statement;
   sqlite3* db_;
   const std::string path_;
+  // Compiled statements not in use, by their text.
+  Cache cache_;
 };
 
 enum class StepResult { Row, Done };
@@ -80,10 +90,13 @@ class Statement {
 
  private:
   friend class Database;
-  Statement(Database& db, sqlite3_stmt* stmt) : db_(&db), stmt_(stmt) {}
+  Statement(Database& db, Database::Cache::node_type entry)
+      : db_(&db), stmt_(entry.mapped()), entry_(std::move(entry)) {}
   Status check(int code, std::string_view what);
   Database* db_;
   sqlite3_stmt* stmt_;
+  // The cache entry the statement returns to; its value is stmt_.
+  Database::Cache::node_type entry_;
 };
 
 // BEGIN IMMEDIATE at construction; ROLLBACK at destruction unless commit()

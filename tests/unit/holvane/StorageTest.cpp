@@ -54,6 +54,44 @@ TEST(StorageTest, OnlyCommittedTransactionsLast) {
   EXPECT_EQ(rowCount(**db), 1);
 }
 
+// Statements are reused: a reused one starts with no bindings and from its
+// first row, a text prepared again while its statement is still stepping
+// gets a statement of its own, and a reused statement sees a changed table.
+TEST(StorageTest, ReusedStatementsStartAfresh) {
+  SystemRoot root;
+  Result<std::unique_ptr<Database>> db = Database::open(root / "s.sqlite");
+  ASSERT_TRUE(db.ok());
+  Database& d = **db;
+  ASSERT_TRUE(d.exec("CREATE TABLE t(v INTEGER UNIQUE)").ok());
+  for (int v : {1, 2, 3}) ASSERT_TRUE(insert(d, v).ok());
+  constexpr std::string_view kAbove = "SELECT v FROM t WHERE v > ?1 ORDER BY v";
+  {
+    Result<Statement> outer = d.prepare(kAbove);
+    ASSERT_TRUE(outer.ok());
+    ASSERT_TRUE(outer->bindInt(1, 1).ok());
+    ASSERT_EQ(*outer->step(), StepResult::Row);
+    EXPECT_EQ(outer->columnInt(0), 2);
+    // The same text while `outer` is mid-way through its rows.
+    Result<Statement> inner = d.prepare(kAbove);
+    ASSERT_TRUE(inner.ok());
+    ASSERT_TRUE(inner->bindInt(1, 2).ok());
+    ASSERT_EQ(*inner->step(), StepResult::Row);
+    EXPECT_EQ(inner->columnInt(0), 3);
+    ASSERT_EQ(*outer->step(), StepResult::Row);
+    EXPECT_EQ(outer->columnInt(0), 3);
+  }
+  // Unbound now: NULL compares as nothing, so no rows.
+  Result<Statement> unbound = d.prepare(kAbove);
+  ASSERT_TRUE(unbound.ok());
+  EXPECT_EQ(*unbound->step(), StepResult::Done);
+  ASSERT_TRUE(d.exec("DROP TABLE t; CREATE TABLE t(v TEXT); INSERT INTO t VALUES('x')").ok());
+  EXPECT_EQ(rowCount(d), 1);
+  Result<Statement> again = d.prepare("SELECT v FROM t");
+  ASSERT_TRUE(again.ok());
+  ASSERT_EQ(*again->step(), StepResult::Row);
+  EXPECT_EQ(again->columnText(0), "x");
+}
+
 TEST(StorageTest, GarbageFileIsReportedAsCorrupt) {
   SystemRoot root;
   writeText(root / "bad.sqlite", std::string(2048, 'x'));

@@ -27,6 +27,35 @@ TEST_F(RegistryPlugInTest, NamesAreKeptUntilTheGenerationChanges) {
   EXPECT_EQ(plugIn->localizedName(), "Gezeigt");
 }
 
+// A lent record stands in for the registry only while the registry is still
+// at the generation it was lent at, and only while its lender keeps it.
+TEST_F(RegistryPlugInTest, LentRecordsServeOnlyTheirGenerationAndTheirLender) {
+  PlugInRecord r = record("System/P.plugin", "com.example.p");
+  std::shared_ptr<QVDPlugIn> plugIn = make(r);
+  ASSERT_NE(plugIn, nullptr);
+  PlugInRecord lentCopy = r;
+  lentCopy.info.set("BXBundleName", "Lent");
+  auto lent = std::make_shared<const PlugInRecord>(lentCopy);
+  plugIn->lendRecord(registry_->generation(), lent);
+  std::size_t lookups = registry_->lookupCount();
+  ASSERT_TRUE(plugIn->getProxy().has_value());
+  EXPECT_EQ(*plugIn->getProxy()->info.get("BXBundleName").string(), "Lent");
+  EXPECT_EQ(registry_->lookupCount(), lookups) << "a lent record needs no lookup";
+
+  // Dropped by its lender: the registry answers again.
+  lent.reset();
+  EXPECT_FALSE(plugIn->getProxy()->info.get("BXBundleName") == platform::Value("Lent"));
+  EXPECT_GT(registry_->lookupCount(), lookups);
+
+  // Lent at a generation that has passed: the registry answers.
+  lent = std::make_shared<const PlugInRecord>(lentCopy);
+  plugIn->lendRecord(registry_->generation(), lent);
+  registry_->put(record("System/Other.plugin", "com.example.other"));
+  lookups = registry_->lookupCount();
+  EXPECT_FALSE(plugIn->getProxy()->info.get("BXBundleName") == platform::Value("Lent"));
+  EXPECT_GT(registry_->lookupCount(), lookups);
+}
+
 TEST_F(RegistryPlugInTest, FallsBackToThePathWhenTheUuidIsUnknown) {
   PlugInRecord r = record("System/P.plugin", "com.example.p");
   std::shared_ptr<QVDPlugIn> plugIn = make(r);

@@ -58,6 +58,35 @@ TEST_F(LinuxSandboxExtensionsTest, KeyIsMadeOwnerOnlyAtFirstUse) {
   EXPECT_TRUE(second.release(*handle).ok());
 }
 
+// A token names the file itself: links and ".." on the way are resolved,
+// so a host holding it cannot be steered elsewhere by changing a link, and a
+// path that names nothing gets no token.
+TEST_F(LinuxSandboxExtensionsTest, CanonicalisedSubjectsNameTheFileItself) {
+  const std::string real = root_.path() + "/real/Bundle.ovx";
+  fs::create_directories(real + "/Resources");
+  fs::create_directory_symlink(root_.path() + "/real", root_.path() + "/link");
+  fs::create_directory_symlink(real + "/Resources", real + "/alias");
+  const std::string canonical = fs::canonical(real).string();
+  const std::pair<std::string, std::string> cases[] = {
+      {root_.path() + "/link/Bundle.ovx", canonical},
+      {root_.path() + "/link/../real/Bundle.ovx/", canonical},
+      {real + "/alias", canonical + "/Resources"},
+  };
+  for (const auto& [given, expected] : cases) {
+    const std::string token = issueFile(given);
+    Result<std::int64_t> handle = extensions_.consume(token);
+    ASSERT_TRUE(handle.ok()) << given;
+    std::optional<ExtensionGrant> grant = LinuxSandboxExtensions::grantForHandle(*handle);
+    ASSERT_TRUE(grant.has_value());
+    EXPECT_EQ(grant->subject, expected) << given;
+    EXPECT_TRUE(extensions_.release(*handle).ok());
+  }
+  Result<std::string> missing =
+      extensions_.issueFileExtension(root_.path() + "/link/Gone.ovx", PathResolution::Canonicalise);
+  ASSERT_FALSE(missing.ok());
+  EXPECT_EQ(sandboxErrno(missing.error()), ENOENT);
+}
+
 TEST_F(LinuxSandboxExtensionsTest, ConcurrentFirstUsersAgreeOnOneKey) {
   std::vector<std::string> tokens(6);
   std::vector<std::thread> threads;
