@@ -63,14 +63,12 @@ void MatchResults::merge(const QVDPlugIn& plugIn, platform::Dictionary form) {
     if (verdict == Verdict::KeepBoth) continue;
     if (verdict == Verdict::DropNew) return;
     same.erase(kept);
-    --keptCount_;
     break;
   }
   auto merged = std::make_shared<platform::Dictionary>(std::move(form));
   transaction_->addAnnotationForPlugIn(plugIn, *merged);
   plugIn.augmentForm(*merged);
   same.push_back(merged);
-  ++keptCount_;
   recordReplacements(plugIn, merged);
 }
 
@@ -86,14 +84,13 @@ void MatchResults::recordReplacements(const QVDPlugIn& plugIn, const Form& form)
 }
 
 void MatchResults::finish() {
-  matches_.reserve(keptCount_);
   for (auto& [identifier, forms] : kept_) {
     for (Form& form : forms) matches_.push_back(std::move(form));
   }
   kept_.clear();
   if (!overrides_.empty()) {
     for (const Form& replaced : matches_) {
-      auto found = overrides_.find(std::string(textOf(*replaced, QVFormIdentifierKey)));
+      auto found = overrides_.find(textOf(*replaced, QVFormIdentifierKey));
       if (found == overrides_.end()) continue;
       const Form& replacing = found->second;
       // Read before writing: a plug-in that names its own identifier is
@@ -110,7 +107,8 @@ void MatchResults::finish() {
     const std::string_view aId = textOf(*a, QVFormIdentifierKey);
     const std::string_view bId = textOf(*b, QVFormIdentifierKey);
     if (aId != bId) return aId < bId;
-    const QVOrdering order = compareVersionString(textOf(*a, QVFormVersionKey), textOf(*b, QVFormVersionKey));
+    const QVOrdering order =
+        compareVersionString(textOf(*a, QVFormVersionKey), textOf(*b, QVFormVersionKey));
     if (order != QVOrdering::Same) return order == QVOrdering::Ascending;
     return textOf(*a, QVFormPathKey) < textOf(*b, QVFormPathKey);
   });

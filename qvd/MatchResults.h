@@ -68,10 +68,9 @@ class MatchResults {
   // Kept forms by identifier: a merge compares a form with the forms of its
   // own identifier only, so that merging n forms costs n steps, not n^2.
   std::unordered_map<std::string, std::vector<Form>> kept_;
-  std::size_t keptCount_ = 0;
   std::vector<Form> matches_;
   // Replaced identifier -> the form of the plug-in that replaces it.
-  std::map<std::string, Form> overrides_;
+  std::map<std::string, Form, std::less<>> overrides_;
 };
 
 // The version text a plug-in's form carries: its version, or "<none>".

@@ -230,18 +230,14 @@ std::optional<QVDPlugInSet> QVDatabase::findPlugIns(
         continue;
       }
     }
-    if (lent == nullptr) {
-      if (std::shared_ptr<QVDPlugIn> plugIn = plugInForProxy(record)) {
-        found.insert(std::move(plugIn));
-      }
-      continue;
-    }
     auto shared = std::make_shared<const PlugInRecord>(std::move(record));
-    if (std::shared_ptr<QVDPlugIn> plugIn = plugInForProxy(*shared)) {
+    std::shared_ptr<QVDPlugIn> plugIn = plugInForProxy(*shared);
+    if (!plugIn) continue;
+    if (lent != nullptr) {
       plugIn->lendRecord(generation, shared);
       lent->push_back(std::move(shared));
-      found.insert(std::move(plugIn));
     }
+    found.insert(std::move(plugIn));
   }
   QVLogOps().debug("HV reported %u plug-ins (cache %u/%u)", found.size(), before,
                    cache_->approximateCount());
