@@ -31,11 +31,13 @@
 #include <memory>
 #include <mutex>
 #include <optional>
+#include <span>
 #include <string>
 #include <string_view>
 #include <utility>
 #include <vector>
 
+#include "platform/cbor/EncodedValue.h"
 #include "platform/dispatch/SerialQueue.h"
 #include "platform/mbx/Connection.h"
 #include "platform/values/Result.h"
@@ -126,12 +128,16 @@ class QVDaemonClient : public std::enable_shared_from_this<QVDaemonClient> {
   static std::optional<platform::Error> errorInReply(
       const platform::Result<platform::Value>& reply);
 
-  // The wire form of a property-list value for protocol `version`. Wire
-  // values are Values, so for version 3 it is the value itself, provided the
-  // message codec can carry it (no none inside, every text valid UTF-8);
-  // anything else, and any other version, gives none. This encodes the value
-  // once to find out, so large values cost a second encoding.
-  static platform::Value convertToMBX(const platform::Value& value, std::uint64_t version);
+  // The wire form of a property-list value for protocol `version`: for
+  // version 3 the value's message encoding, which a reply carries as the
+  // value itself, provided the codec can carry it (no none inside, every
+  // text valid UTF-8); anything else, and any other version, gives none.
+  static std::optional<platform::cbor::EncodedValue> convertToMBX(const platform::Value& value,
+                                                                  std::uint64_t version);
+  // The same for a list whose elements are encoded already: what the list
+  // of their values gives, without walking them again.
+  static std::optional<platform::cbor::EncodedValue> convertToMBX(
+      std::span<const platform::cbor::EncodedValue> elements, std::uint64_t version);
   // The property-list value of a wire value when this client speaks
   // version 3; none for any other version.
   platform::Value convertFromMBX(const platform::Value& wireValue) const;

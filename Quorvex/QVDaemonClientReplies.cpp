@@ -58,12 +58,21 @@ std::optional<Error> QVDaemonClient::errorInReply(const Result<Value>& reply) {
                                     : std::string("unknown error returned by Quorvex subsystem"));
 }
 
-Value QVDaemonClient::convertToMBX(const Value& value, std::uint64_t version) {
-  if (version != QVDProtocolVersion) return Value();
+std::optional<platform::cbor::EncodedValue> QVDaemonClient::convertToMBX(
+    const Value& value, std::uint64_t version) {
+  if (version != QVDProtocolVersion) return std::nullopt;
   // The codec is the judge of what can travel: a none nested anywhere, or
   // text that is not UTF-8, would only fail later, when sending.
-  if (value.isNone() || !platform::cbor::checkEncodable(value).ok()) return Value();
-  return value;
+  platform::Result<platform::cbor::EncodedValue> encoded =
+      platform::cbor::EncodedValue::encode(value);
+  if (!encoded.ok()) return std::nullopt;
+  return std::move(encoded).value();
+}
+
+std::optional<platform::cbor::EncodedValue> QVDaemonClient::convertToMBX(
+    std::span<const platform::cbor::EncodedValue> elements, std::uint64_t version) {
+  if (version != QVDProtocolVersion) return std::nullopt;
+  return platform::cbor::EncodedValue::array(elements);
 }
 
 Value QVDaemonClient::convertFromMBX(const Value& wireValue) const {

@@ -62,6 +62,7 @@ void MatchResults::merge(const QVDPlugIn& plugIn, platform::Dictionary form) {
     const Verdict verdict = compare(plugIn, **kept);
     if (verdict == Verdict::KeepBoth) continue;
     if (verdict == Verdict::DropNew) return;
+    encodings_.erase(kept->get());
     same.erase(kept);
     break;
   }
@@ -70,6 +71,30 @@ void MatchResults::merge(const QVDPlugIn& plugIn, platform::Dictionary form) {
   plugIn.augmentForm(*merged);
   same.push_back(merged);
   recordReplacements(plugIn, merged);
+  encode(merged);
+}
+
+void MatchResults::encode(const Form& form) {
+  platform::Result<platform::cbor::EncodedValue> encoded =
+      platform::cbor::EncodedValue::encode(*form);
+  if (!encoded.ok()) {
+    encodings_.erase(form.get());
+    QVLogOps().error("plug-in form %{public}@ cannot be sent: %{public}@", form->get(QVFormUUIDKey),
+                     encoded.error());
+    return;
+  }
+  encodings_.insert_or_assign(form.get(), std::move(encoded).value());
+}
+
+std::optional<std::vector<platform::cbor::EncodedValue>> MatchResults::encodedMatches() const {
+  std::vector<platform::cbor::EncodedValue> list;
+  list.reserve(matches_.size());
+  for (const Form& form : matches_) {
+    auto found = encodings_.find(form.get());
+    if (found == encodings_.end()) return std::nullopt;
+    list.push_back(found->second);
+  }
+  return list;
 }
 
 void MatchResults::recordReplacements(const QVDPlugIn& plugIn, const Form& form) {
@@ -99,6 +124,8 @@ void MatchResults::finish() {
       const platform::Value replacedIdentifier = replaced->get(QVFormIdentifierKey);
       replaced->set(QVOverriderFormKey, replacingUuid);
       replacing->set(QVOverridingFormKey, replacedIdentifier);
+      encode(replaced);
+      encode(replacing);
       QVLogOps().info("plug-in %{public}@ overrides %{public}@", replacingUuid,
                       replaced->get(QVFormUUIDKey));
     }

@@ -10,11 +10,13 @@
 
 #include <cstdint>
 #include <map>
+#include <optional>
 #include <memory>
 #include <string>
 #include <unordered_map>
 #include <vector>
 
+#include "platform/cbor/EncodedValue.h"
 #include "platform/dispatch/SerialQueue.h"
 #include "platform/values/Dictionary.h"
 #include "qvd/QVDPlugIn.h"
@@ -40,8 +42,9 @@ class MatchResults {
 
   // Merges the exported `form` of `plugIn`: applies the version-duplicate
   // rule against the forms kept so far, then (when kept) adds the
-  // annotations and daemon-side fields and records the plug-in's
-  // replacement declarations. REQUIRES: on postExportQueue().
+  // annotations and daemon-side fields, records the plug-in's replacement
+  // declarations and encodes the form for the reply, while other forms are
+  // still being exported. REQUIRES: on postExportQueue().
   void merge(const QVDPlugIn& plugIn, platform::Dictionary form);
 
   // Gathers the kept forms, marks replacements ("overrider" on the
@@ -52,6 +55,9 @@ class MatchResults {
 
   // REQUIRES: finish() has run.
   const std::vector<Form>& matches() const { return matches_; }
+  // The encodings of matches(), in their order; none when a form cannot be
+  // encoded. REQUIRES: finish() has run.
+  std::optional<std::vector<platform::cbor::EncodedValue>> encodedMatches() const;
 
  private:
   enum class Verdict { KeepBoth, DropNew, ReplaceKept };
@@ -61,6 +67,8 @@ class MatchResults {
   // Whether `plugIn` wins over a kept form of the same version.
   static bool preferred(const QVDPlugIn& plugIn, const platform::Dictionary& kept);
   void recordReplacements(const QVDPlugIn& plugIn, const Form& form);
+  // (Re-)encodes `form`; a failure is logged and leaves no encoding.
+  void encode(const Form& form);
 
   const std::uint64_t flags_;
   const std::shared_ptr<const Transaction> transaction_;
@@ -71,6 +79,8 @@ class MatchResults {
   std::vector<Form> matches_;
   // Replaced identifier -> the form of the plug-in that replaces it.
   std::map<std::string, Form, std::less<>> overrides_;
+  // Each kept form's encoding, as it stands.
+  std::unordered_map<const platform::Dictionary*, platform::cbor::EncodedValue> encodings_;
 };
 
 // The version text a plug-in's form carries: its version, or "<none>".

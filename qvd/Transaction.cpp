@@ -118,7 +118,8 @@ void Transaction::done() {
                      static_cast<unsigned long long>(reply_.requestId()), client_->pid());
     return;
   }
-  probes::requestOutput(client_->pid(), [&] { return platform::Value(reply_.body()).description(); });
+  probes::requestOutput(client_->pid(),
+                        [&] { return platform::Value(reply_.bodyForDescription()).description(); });
   // Sent without waiting; a client that has gone meanwhile gets nothing.
   platform::Status sent = reply_.send();
   if (sent.ok()) return;
@@ -127,10 +128,10 @@ void Transaction::done() {
   QVLogOps().error("reply to request %llu of client %d not sent: %{public}@",
                    static_cast<unsigned long long>(reply_.requestId()), client_->pid(),
                    sent.error());
-  reply_.body() = platform::Dictionary{
+  reply_.replaceBody(platform::Dictionary{
       {std::string(QVDErrorCodeKey), static_cast<std::uint64_t>(QVErrorInvalidRequest)},
       {std::string(QVDErrorKey), "reply too large to send (" + sent.error().description() +
-                                     "); narrow the request"}};
+                                     "); narrow the request"}});
   (void)reply_.send();
 }
 

@@ -96,6 +96,11 @@ class Transaction : public std::enable_shared_from_this<Transaction> {
   // The reply being built. REQUIRES: the transaction is not yet finished and
   // only one queue builds it at a time.
   platform::Dictionary& reply() { return reply_.body(); }
+  // Puts a value already in its wire encoding into the reply under `key`.
+  // REQUIRES: as for reply().
+  void setReplyEncoded(std::string key, platform::cbor::EncodedValue value) {
+    reply_.setEncoded(std::move(key), std::move(value));
+  }
   std::uint64_t version() const { return version_.load(); }
   bool finished() const { return finished_.load(); }
 

@@ -54,10 +54,11 @@ void Transaction::findPlugIn() {
   }
   addAnnotationForPlugIn(*plugIn, *form);
   plugIn->augmentForm(*form);
-  platform::Value matches = QVDaemonClient::convertToMBX(platform::Value(std::move(*form)), version());
+  std::optional<platform::cbor::EncodedValue> matches =
+      QVDaemonClient::convertToMBX(platform::Value(std::move(*form)), version());
   // A version-2 request gets no form: its whole-value encoding is not
   // defined, and the request still succeeds.
-  if (!matches.isNone()) reply().set(QVDMatchesKey, std::move(matches));
+  if (matches) setReplyEncoded(std::string(QVDMatchesKey), std::move(*matches));
   done();
 }
 

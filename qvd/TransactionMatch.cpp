@@ -30,6 +30,9 @@ namespace qvd {
 
 namespace {
 
+// Plug-ins per export work item.
+constexpr std::size_t kExportBatch = 16;
+
 std::string uuidText(const QVDPlugIn& plugIn) {
   const std::optional<platform::Uuid> uuid = plugIn.uuid();
   return uuid ? uuid->toString() : std::string("(none)");
@@ -94,7 +97,45 @@ void Transaction::matchPlugIns() {
   const auto exportQueue =
       platform::dispatch::ConcurrentQueue::shared(platform::dispatch::Priority::UserInitiated);
   const auto exportSlots = std::make_shared<platform::dispatch::Semaphore>(
-      static_cast<std::int64_t>(std::max(2u, 4 * std::thread::hardware_concurrency())));
+      static_cast<std::int64_t>(std::max(2u, 2 * std::thread::hardware_concurrency())));
+  // Accepted plug-ins go out in small batches: one export work item and
+  // one merge per batch rather than per plug-in, because waking a pool
+  // thread twice per plug-in cost more than exporting most of them.
+  std::vector<std::shared_ptr<QVDPlugIn>> batch;
+  const auto exportBatch = [&](std::vector<std::shared_ptr<QVDPlugIn>> plugIns) {
+    // Exports wait on the registry's and the database's queues, which need
+    // pool threads of their own: with thousands in flight at once, every
+    // pool thread would wait on work that no thread is left to run. A few
+    // per core keep both cores busy.
+    {
+      platform::dispatch::ScopedBlockingCall blocking;
+      exportSlots->wait();
+    }
+    exportQueue->async([plugIns = std::move(plugIns), results, exports, exportSlots] {
+      std::vector<std::pair<std::shared_ptr<QVDPlugIn>, platform::Dictionary>> forms;
+      forms.reserve(plugIns.size());
+      for (const std::shared_ptr<QVDPlugIn>& p : plugIns) {
+        std::optional<platform::Error> error;
+        std::optional<platform::Dictionary> form = p->exportForm(&error);
+        if (!form) {
+          QVLogOps().error("failed to export matching plug-in %{public}@: %{public}@",
+                           uuidText(*p),
+                           error ? error->description() : std::string("unknown error"));
+          exports->leave();
+          continue;
+        }
+        forms.emplace_back(p, std::move(*form));
+      }
+      exportSlots->signal();
+      if (forms.empty()) return;
+      results->postExportQueue()->async([results, exports, forms = std::move(forms)]() mutable {
+        for (auto& [p, form] : forms) {
+          results->merge(*p, std::move(form));
+          exports->leave();
+        }
+      });
+    });
+  };
   for (const std::shared_ptr<QVDPlugIn>& p : candidates) {
     if (!all) {
       if (!p->onSystemVolume()) {
@@ -125,32 +166,15 @@ void Transaction::matchPlugIns() {
         continue;
       }
     }
-    // Exports wait on the registry's and the database's queues, which need
-    // pool threads of their own: with thousands in flight at once, every
-    // pool thread would wait on work that no thread is left to run. A few
-    // per core keep both cores busy.
-    {
-      platform::dispatch::ScopedBlockingCall blocking;
-      exportSlots->wait();
-    }
-    // Left by the merge, or here when there is nothing to merge.
+    // Left by the merge, or by the export when there is nothing to merge.
     exports->enter();
-    exportQueue->async([p, results, exports, exportSlots] {
-      std::optional<platform::Error> error;
-      std::optional<platform::Dictionary> form = p->exportForm(&error);
-      exportSlots->signal();
-      if (!form) {
-        QVLogOps().error("failed to export matching plug-in %{public}@: %{public}@", uuidText(*p),
-                         error ? error->description() : std::string("unknown error"));
-        exports->leave();
-        return;
-      }
-      results->postExportQueue()->async([p, results, exports, form = std::move(*form)]() mutable {
-        results->merge(*p, std::move(form));
-        exports->leave();
-      });
-    });
+    batch.push_back(p);
+    if (batch.size() == kExportBatch) {
+      exportBatch(std::move(batch));
+      batch.clear();
+    }
   }
+  if (!batch.empty()) exportBatch(std::move(batch));
   {
     // Exports and merges run on other queues; the pool may add a thread
     // while this one waits.
@@ -159,23 +183,23 @@ void Transaction::matchPlugIns() {
   }
 
   results->finish();
-  platform::Array matches;
-  platform::Array uuids;
-  for (const MatchResults::Form& form : results->matches()) {
-    uuids.append(form->get(QVFormUUIDKey));
-    matches.append(*form);
-  }
-  if (matches.empty()) {
+  if (results->matches().empty()) {
     QVLogOps().info("Resulting plugin count: 0");
-  } else {
+  } else if (QVLogOps().isEnabled(platform::log::Level::Info)) {
+    platform::Array uuids;
+    for (const MatchResults::Form& form : results->matches()) uuids.append(form->get(QVFormUUIDKey));
     QVLogOps().info("Resulting plugin count: %u, UUIDs: %{public}@",
-                    static_cast<unsigned>(matches.size()), platform::Value(std::move(uuids)));
+                    static_cast<unsigned>(uuids.size()), platform::Value(std::move(uuids)));
   }
-  platform::Value converted = QVDaemonClient::convertToMBX(platform::Value(std::move(matches)),
-                                                           version());
-  // A version-2 request gets no forms: their whole-value encoding is not
-  // defined for it, and the request still succeeds.
-  if (!converted.isNone()) reply().set(QVDMatchesKey, std::move(converted));
+  // The forms were encoded as they were merged; a version-2 request gets
+  // none (their whole-value encoding is not defined for it), nor does a
+  // list with a form that cannot travel, and the request still succeeds.
+  if (std::optional<std::vector<platform::cbor::EncodedValue>> forms = results->encodedMatches()) {
+    if (std::optional<platform::cbor::EncodedValue> converted =
+            QVDaemonClient::convertToMBX(*forms, version())) {
+      setReplyEncoded(std::string(QVDMatchesKey), std::move(*converted));
+    }
+  }
   QVLogOps().debug("reply marshalled");
   done();
 }

@@ -13,11 +13,6 @@ Status encode(const Value& value, std::vector<std::uint8_t>& out) {
   return internal::Encoder(out).run(value);
 }
 
-Status checkEncodable(const Value& value) {
-  std::vector<std::uint8_t> unused;
-  return internal::Encoder(unused, internal::Encoder::Mode::Check).run(value);
-}
-
 Result<std::vector<std::uint8_t>> encode(const Value& value) {
   std::vector<std::uint8_t> out;
   Status status = encode(value, out);

@@ -62,8 +62,4 @@ platform::Status encode(const platform::Value& value, std::vector<std::uint8_t>&
 // The encoding of `value` in a new buffer.
 platform::Result<std::vector<std::uint8_t>> encode(const platform::Value& value);
 
-// What encode() would answer about `value`, without producing the bytes:
-// the error it would fail with, or ok.
-platform::Status checkEncodable(const platform::Value& value);
-
 }  // namespace platform::cbor

@@ -29,10 +29,12 @@
 #include <memory>
 #include <mutex>
 #include <optional>
+#include <span>
 #include <string>
 #include <string_view>
 #include <variant>
 
+#include "platform/cbor/EncodedValue.h"
 #include "platform/dispatch/FdSource.h"
 #include "platform/dispatch/Semaphore.h"
 #include "platform/dispatch/SerialQueue.h"
@@ -133,7 +135,9 @@ class Connection : public std::enable_shared_from_this<Connection> {
 
   // Fails only when `body` cannot be framed; a reply that cannot be
   // delivered (the peer has gone) is dropped and logged.
-  platform::Status sendReply(std::uint64_t requestId, platform::Value body);
+  // `encoded` entries join the body's map as they are.
+  platform::Status sendReply(std::uint64_t requestId, platform::Value body,
+                             std::span<const platform::cbor::EncodedEntry> encoded = {});
   // Stamps the next message id on `frame` and writes or queues it; registers
   // `pending` under that id when given. Fails only when nothing was sent.
   platform::Status transmit(std::vector<std::uint8_t> frame, internal::PendingReply* pending);

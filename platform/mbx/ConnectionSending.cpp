@@ -190,8 +190,10 @@ void Connection::sendGoodbye() {
   if (frame.ok()) (void)transmit(std::move(frame).value(), nullptr);
 }
 
-Status Connection::sendReply(std::uint64_t requestId, Value body) {
-  Result<std::vector<std::uint8_t>> frame = encodeFrame(FrameKind::Reply, requestId, body);
+Status Connection::sendReply(std::uint64_t requestId, Value body,
+                             std::span<const cbor::EncodedEntry> encoded) {
+  Result<std::vector<std::uint8_t>> frame =
+      encodeFrame(FrameKind::Reply, requestId, body, encoded);
   if (!frame.ok()) {
     mbxLog().error("%{public}s: reply to request %llu not sent: %@", description(),
                    ull(requestId), frame.error());

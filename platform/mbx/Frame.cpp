@@ -69,13 +69,17 @@ FrameHeader readHeader(std::span<const std::uint8_t, kFrameHeaderSize> in) {
 }
 
 Result<std::vector<std::uint8_t>> encodeFrame(FrameKind kind, std::uint64_t inReplyTo,
-                                              const Value& body) {
+                                              const Value& body,
+                                              std::span<const cbor::EncodedEntry> encoded) {
   assert((kind == FrameKind::Reply) == (inReplyTo != 0));
+  assert(encoded.empty() || body.dictionary() != nullptr);
   std::vector<std::uint8_t> frame(kFrameHeaderSize);
   if (kind != FrameKind::Goodbye) {
     frame.reserve(kTypicalFrameBytes);  // one allocation for most messages
-    if (Status encoded = cbor::encode(body, frame); !encoded.ok()) {
-      const std::string* text = encoded.error().localizedDescription();
+    const Status written = encoded.empty() ? cbor::encode(body, frame)
+                                           : cbor::encodeMap(*body.dictionary(), encoded, frame);
+    if (!written.ok()) {
+      const std::string* text = written.error().localizedDescription();
       return makeError(ErrorCode::UnencodableBody, text != nullptr ? *text : std::string());
     }
   }

@@ -23,6 +23,7 @@
 #include <span>
 #include <vector>
 
+#include "platform/cbor/EncodedValue.h"
 #include "platform/values/Result.h"
 #include "platform/values/Value.h"
 
@@ -73,10 +74,13 @@ FrameHeader readHeader(std::span<const std::uint8_t, kFrameHeaderSize> in);
 // A whole frame: header with message id 0 (the sender stamps the real id with
 // setMessageId when it knows the order of sending), then the CBOR body.
 // Fails with an MBX error (UnencodableBody, BodyTooLarge) when the body
-// cannot be sent. `body` is ignored for a goodbye.
-// REQUIRES: inReplyTo != 0 exactly when kind == FrameKind::Reply.
-platform::Result<std::vector<std::uint8_t>> encodeFrame(FrameKind kind, std::uint64_t inReplyTo,
-                                                        const platform::Value& body);
+// cannot be sent. `body` is ignored for a goodbye. `encoded` entries are
+// added to the body's map as they are (see cbor::encodeMap).
+// REQUIRES: inReplyTo != 0 exactly when kind == FrameKind::Reply; when
+// `encoded` is not empty, `body` is a dictionary without their keys.
+platform::Result<std::vector<std::uint8_t>> encodeFrame(
+    FrameKind kind, std::uint64_t inReplyTo, const platform::Value& body,
+    std::span<const platform::cbor::EncodedEntry> encoded = {});
 
 // REQUIRES: frame.size() >= kFrameHeaderSize.
 void setMessageId(std::vector<std::uint8_t>& frame, std::uint64_t messageId);

@@ -16,7 +16,10 @@
 
 #include <cstdint>
 #include <memory>
+#include <string>
+#include <vector>
 
+#include "platform/cbor/EncodedValue.h"
 #include "platform/mbx/KeepAliveTransaction.h"
 #include "platform/mbx/Message.h"
 #include "platform/values/Result.h"
@@ -36,6 +39,16 @@ class Reply {
   Reply& operator=(const Reply&) = delete;
 
   platform::Dictionary& body() { return body_; }
+  // Adds an entry whose value is already encoded; it replaces an entry of
+  // the same key, encoded or not. The peer cannot tell it from a body()
+  // entry: this only spares the sender a second walk of a large value.
+  // An entry of this key set on body() afterwards is ignored.
+  void setEncoded(std::string key, platform::cbor::EncodedValue value);
+  // Replaces the whole body, encoded entries included.
+  void replaceBody(platform::Dictionary body);
+  // The body with the encoded entries decoded back: for descriptions only,
+  // as it costs a full decode.
+  platform::Dictionary bodyForDescription() const;
   std::uint64_t requestId() const { return requestId_; }
 
   // Sends the body (moved out) once; later calls do nothing. Ends the
@@ -56,6 +69,7 @@ class Reply {
   bool expected_;
   bool sent_ = false;
   platform::Dictionary body_;
+  std::vector<platform::cbor::EncodedEntry> encoded_;
   std::shared_ptr<KeepAliveTransaction> transaction_;
 };
 

@@ -19,21 +19,19 @@ std::uint8_t* Encoder::room(std::size_t size) {
 }
 
 void Encoder::writeHead(std::uint8_t major, std::uint64_t argument) {
-  if (check_) return;
   std::uint8_t* at = room(kMaxHeadSize);
   used_ -= kMaxHeadSize - internal::writeHead(major, argument, at);
 }
 
 void Encoder::writeBytes(const void* bytes, std::size_t size) {
-  if (size != 0 && !check_) std::memcpy(room(size), bytes, size);
+  if (size != 0) std::memcpy(room(size), bytes, size);
 }
 
 void Encoder::writeByte(std::uint8_t byte) {
-  if (!check_) *room(1) = byte;
+  *room(1) = byte;
 }
 
 void Encoder::writeDouble(double d) {
-  if (check_) return;
   std::uint8_t* at = room(kMaxHeadSize);
   at[0] = (kMajorSimple << 5) | kFloat64;
   storeBig64(std::bit_cast<std::uint64_t>(d), at + 1);
@@ -124,12 +122,10 @@ std::string Encoder::currentPath() const {
   return path.empty() ? "/" : path;
 }
 
-Status Encoder::run(const Value& root) {
-  const std::size_t start = out_.size();
-  used_ = start;
+bool Encoder::writeTree(const Value& root) {
   const Value* value = &root;
   for (;;) {
-    if (!writeValue(*value)) break;
+    if (!writeValue(*value)) return false;
     // Find the next value to write: the next child of the innermost
     // container that has one left, writing dictionary keys on the way.
     value = nullptr;
@@ -142,24 +138,59 @@ Status Encoder::run(const Value& root) {
         }
       } else if (top.next < top.dictionary->size()) {
         const Dictionary::Entry& entry = top.dictionary->entries()[top.next++];
-        if (!writeText(entry.first)) break;
+        if (!writeText(entry.first)) return false;
         value = &entry.second;
         break;
       }
       stack_.pop_back();
     }
-    if (!value) {
-      if (stack_.empty()) {
-        out_.resize(used_);
-        return okStatus();
-      }
-      break;  // a key failed
-    }
+    if (!value) return true;
+  }
+}
+
+Status Encoder::run(const Value& root) {
+  const std::size_t start = out_.size();
+  used_ = start;
+  if (writeTree(root)) {
+    out_.resize(used_);
+    return okStatus();
   }
   out_.resize(start);
   // A failing container was already pushed only if it was written, so the
   // path is that of the failing value (or key) itself.
   return encodeFailure(failure_, failureWhat_ + " (at " + currentPath() + ")");
+}
+
+Status Encoder::runMap(const Dictionary& entries, std::span<const EncodedEntry> encoded) {
+  const std::size_t start = out_.size();
+  used_ = start;
+  writeHead(kMajorMap, entries.size() + encoded.size());
+  std::string_view failedKey;
+  bool written = true;
+  for (const auto& [key, value] : entries) {
+    failedKey = key;
+    if (!writeText(key) || !writeTree(value)) {
+      written = false;
+      break;
+    }
+  }
+  if (written) {
+    for (const auto& [key, value] : encoded) {
+      failedKey = key;
+      if (!writeText(key)) {
+        written = false;
+        break;
+      }
+      writeBytes(value.bytes().data(), value.size());
+    }
+  }
+  if (written) {
+    out_.resize(used_);
+    return okStatus();
+  }
+  out_.resize(start);
+  const std::string below = stack_.empty() ? std::string() : currentPath();
+  return encodeFailure(failure_, failureWhat_ + " (at /" + std::string(failedKey) + below + ")");
 }
 
 }  // namespace platform::cbor::internal

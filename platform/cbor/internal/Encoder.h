@@ -7,30 +7,30 @@
 
 #include <cstddef>
 #include <cstdint>
+#include <span>
 #include <string>
 #include <string_view>
 #include <vector>
 
 #include "platform/cbor/Cbor.h"
+#include "platform/cbor/EncodedValue.h"
 
 namespace platform::cbor::internal {
 
 class Encoder {
  public:
-  // Write produces the bytes; Check walks the value with every check of
-  // Write and produces nothing, for callers that only need to know whether
-  // a value can travel.
-  enum class Mode { Write, Check };
-
   // REQUIRES: `out` outlives the Encoder.
-  explicit Encoder(std::vector<std::uint8_t>& out, Mode mode = Mode::Write)
-      : out_(out), check_(mode == Mode::Check) {}
+  explicit Encoder(std::vector<std::uint8_t>& out) : out_(out) {}
   Encoder(const Encoder&) = delete;
   Encoder& operator=(const Encoder&) = delete;
 
   // Appends the encoding of `value`; on failure `out` is cut back to the
   // size it had. REQUIRES: called at most once.
   Status run(const Value& value);
+  // Appends the map of `entries` followed by `encoded` (see
+  // cbor::encodeMap); on failure `out` is cut back. REQUIRES: called at most
+  // once, and not together with run().
+  Status runMap(const Dictionary& entries, std::span<const EncodedEntry> encoded);
 
  private:
   // An array or dictionary whose children are being written.
@@ -40,6 +40,9 @@ class Encoder {
     std::size_t next;              // index of the next child
   };
 
+  // Writes `root` and everything below it; false when something cannot be
+  // encoded.
+  bool writeTree(const Value& root);
   // Each writer returns false when the value cannot be encoded.
   bool writeValue(const Value& value);
   bool writeText(std::string_view text);
@@ -55,7 +58,6 @@ class Encoder {
   // out_ runs ahead of what is written (its tail is scratch space) until
   // run() trims it to used_.
   std::vector<std::uint8_t>& out_;
-  const bool check_;
   std::size_t used_ = 0;
   std::vector<Frame> stack_;
   ErrorCode failure_ = ErrorCode::kUnencodableValue;

@@ -115,10 +115,13 @@ TEST_F(MbxConnection, RepliesComeFromTheOtherProcessToTheirOwnCallers) {
 }
 
 TEST_F(MbxConnection, LargeRepliesDrainThroughTheOutputQueue) {
-  // 8 MiB cannot go out in one write: the rest waits for the socket.
+  // 8 MiB cannot go out in one write: the rest waits for the socket. The
+  // blob travels already encoded, which the peer cannot tell.
   TestServer server("large", {}, [](const std::shared_ptr<Connection>&, const Message& m) {
     Reply reply = Reply::createReply(m);
-    reply.body().set("blob", Data(8u << 20, 0x5a));
+    reply.setEncoded("blob", cbor::EncodedValue::encode(Value(Data(8u << 20, 0x5a))).value());
+    reply.body().set("blob", "set later, ignored");
+    reply.body().set("plain", 1);
     (void)reply.send();
   });
   auto connection = connect("large");
@@ -126,7 +129,26 @@ TEST_F(MbxConnection, LargeRepliesDrainThroughTheOutputQueue) {
   auto reply = connection->sendWithReplySync(Dictionary{});
   ASSERT_TRUE(reply.ok()) << reply.error().description();
   EXPECT_EQ(*reply.value().dictionary()->get("blob").data(), Data(8u << 20, 0x5a));
+  EXPECT_EQ(reply.value().dictionary()->get("plain"), Value(1));
   EXPECT_EQ(server.connection(0)->queuedOutputBytesForTesting(), 0u);
+}
+
+TEST_F(MbxConnection, AnUnsendableReplyCanBeReplacedByAnother) {
+  std::atomic<bool> firstRefused{false};
+  TestServer server("oversize", {}, [&](const std::shared_ptr<Connection>&, const Message& m) {
+    Reply reply = Reply::createReply(m);
+    reply.setEncoded("blob", cbor::EncodedValue::encode(Value(Data(kMaxBodyBytes, 1))).value());
+    const Status first = reply.send();
+    firstRefused = !first.ok() && errorCodeOf(first.error()) == ErrorCode::BodyTooLarge;
+    reply.replaceBody(Dictionary{{"error", "too large"}});
+    (void)reply.send();
+  });
+  auto connection = connect("oversize");
+  ASSERT_NE(connection, nullptr);
+  auto reply = connection->sendWithReplySync(Dictionary{});
+  ASSERT_TRUE(reply.ok()) << reply.error().description();
+  EXPECT_TRUE(firstRefused.load());
+  EXPECT_EQ(Value(*reply.value().dictionary()), Value(Dictionary{{"error", "too large"}}));
 }
 
 TEST_F(MbxConnection, RequestsFailWithTheConnectionsErrorWhenThePeerDies) {

@@ -132,11 +132,14 @@ TEST_F(QVDaemonClientSending, SynchronousMatchCarriesNestedValuesBothWays) {
       {"list", platform::Array{-5, 18446744073709551615ull, 2.5, true, "text"}},
       {"nested", Dictionary{{"empty", Dictionary{}}, {"none of it", platform::Array{}}}},
   });
-  const Value wire = QVDaemonClient::convertToMBX(payload, 3);
-  ASSERT_FALSE(wire.isNone());
+  const std::optional<platform::cbor::EncodedValue> wire = QVDaemonClient::convertToMBX(payload, 3);
+  ASSERT_TRUE(wire);
+  EXPECT_EQ(wire->decode(), payload);
+  EXPECT_FALSE(QVDaemonClient::convertToMBX(payload, 2));
+  EXPECT_FALSE(QVDaemonClient::convertToMBX(Value(platform::Array{"ok", Value()}), 3));
   // A synchronous match finishes on the calling thread before returning.
   Seen seen;
-  qvd->matchPlugIns(Dictionary{{"payload", wire}}, QVDiscoverSynchronous, seen.handler(qvd));
+  qvd->matchPlugIns(Dictionary{{"payload", payload}}, QVDiscoverSynchronous, seen.handler(qvd));
   ASSERT_TRUE(seen.ran);
   EXPECT_EQ(seen.thread, std::this_thread::get_id());
   EXPECT_FALSE(seen.onReplyQueue);
