@@ -8,6 +8,7 @@
 #include "platform/lumend/LinuxServiceManager.h"
 #include "platform/notify/LinuxNotificationCenter.h"
 #include "platform/prefs/LinuxPreferenceStore.h"
+#include "platform/pvg/LinuxConsentService.h"
 #include "platform/sandbox/LinuxSandboxCheck.h"
 #include "platform/sandbox/LinuxSandboxExtensions.h"
 #include "platform/types/LinuxTypeRegistry.h"
@@ -39,6 +40,7 @@ platform::Result<Platform> Platform::linuxPlatform() {
   services.types = std::make_shared<platform::types::LinuxTypeRegistry>();
   services.serviceManager = std::make_shared<platform::lumend::LinuxServiceManager>();
   services.assertions = std::make_shared<platform::vouchd::LinuxAssertionService>();
+  services.consents = std::make_shared<platform::pvg::LinuxConsentService>();
   return services;
 }
 

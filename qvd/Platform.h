@@ -15,6 +15,7 @@
 #include "platform/lumend/ServiceManager.h"
 #include "platform/notify/NotificationCenter.h"
 #include "platform/prefs/PreferenceStore.h"
+#include "platform/pvg/ConsentService.h"
 #include "platform/sandbox/SandboxCheck.h"
 #include "platform/sandbox/SandboxExtensions.h"
 #include "platform/types/TypeRegistry.h"
@@ -40,6 +41,8 @@ struct Platform {
   std::shared_ptr<platform::lumend::ServiceManager> serviceManager;
   // The process-assertion service (vouchd): which plug-ins are busy.
   std::shared_ptr<const platform::vouchd::AssertionService> assertions;
+  // The privacy-consent service (pvg): what applications were granted.
+  std::shared_ptr<const platform::pvg::ConsentService> consents;
 
   // The Linux implementations, all under the platform root; the registry
   // has registered what is installed before this returns. Fails when this
@@ -50,7 +53,7 @@ struct Platform {
   // True when every service is present.
   bool complete() const {
     return entitlements && sandbox && preferences && notifications && containers && registry &&
-           locale && extensions && types && serviceManager && assertions;
+           locale && extensions && types && serviceManager && assertions && consents;
   }
 };
 

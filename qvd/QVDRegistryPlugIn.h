@@ -17,6 +17,7 @@
 #include <memory>
 #include <mutex>
 #include <optional>
+#include <set>
 #include <string>
 #include <string_view>
 
@@ -25,6 +26,8 @@
 #include "platform/holvane/RegistrationRecord.h"
 #include "platform/holvane/Registry.h"
 #include "platform/locale/LocaleService.h"
+#include "platform/lumend/ServiceManager.h"
+#include "platform/pvg/ConsentService.h"
 #include "platform/sandbox/SandboxExtensions.h"
 #include "platform/types/TypeRegistry.h"
 #include "platform/values/Error.h"
@@ -57,6 +60,12 @@ class QVDPlugIn final : public QVPlugInCore, public QVDAnnotated {
     // Type conformance and activation rules for match rules. May be null:
     // then type operators and dictionary patterns match nothing.
     std::shared_ptr<const platform::types::TypeRegistry> types = nullptr;
+    // The service manager that enabling tells. May be null: then enabling
+    // fails as a refusal does.
+    std::shared_ptr<platform::lumend::ServiceManager> serviceManager = nullptr;
+    // The privacy consents of containing applications. May be null: then
+    // none is granted.
+    std::shared_ptr<const platform::pvg::ConsentService> consents = nullptr;
   };
 
   // ---- Construction and validation (QVDRegistryPlugIn.cpp) ----
@@ -176,6 +185,25 @@ class QVDPlugIn final : public QVPlugInCore, public QVDAnnotated {
   // The same, given the host's entitlements as read once for a request that
   // asks about many plug-ins.
   std::optional<std::string> allowForClient(const platform::Dictionary& hostEntitlements) const;
+
+  // ---- Enabling (QVDRegistryPlugInEnabling.cpp) ----
+
+  // Lets `client` run this plug-in as a service: hands the service manager
+  // the plug-in's executable and an overlay of {"MBXService": the
+  // manifest's service dictionary with the merged environment and the
+  // sandbox profile, "BXBundlePackageType": "MBX!"}. The environment is the
+  // host's, then the data container's HOME, BXFIXED_USER_HOME and TMPDIR,
+  // then QVTEST_SDK from the daemon's own, then the plug-in's declared
+  // variables, each replacing the one before. None on success, else a
+  // code-4 error. Blocks on the service manager.
+  std::optional<platform::Error> enableForClient(
+      const QVDMbxClient& client, const std::optional<platform::Dictionary>& environment) const;
+  // The consent services granted to the containing application; empty
+  // without one, or when the consents cannot be read (logged). Read afresh
+  // on every call.
+  std::set<std::string> allowedPVGServices() const;
+  // The sandbox profile enabling assigns, by extension point.
+  std::string sandboxProfile() const;
 
   // ---- Busy (QVDRegistryPlugInBusy.cpp) ----
 

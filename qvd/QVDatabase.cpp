@@ -28,34 +28,12 @@ platform::Status QVDatabase::initDatabase(std::optional<std::string> databasePat
   annotations_ = std::move(store).value();
   registry_ = services.registry;
   notifications_ = services.notifications;
-  plugInServices_ = {services.registry, services.locale, services.extensions, services.types};
+  plugInServices_ = {services.registry,       services.locale,
+                     services.extensions,     services.types,
+                     services.serviceManager, services.consents};
 
-  // The observers outlive nothing they borrow: both hold the cache weakly.
-  // The registry runs its observers on its own queue, and the database
-  // queue calls into the registry (a look-up by UUID runs there); waiting
-  // on the database queue from the registry's would risk each waiting on
-  // the other, so the drop is queued instead. It still runs before any
-  // look-up submitted after the notice.
+  observeInstallations();
   std::weak_ptr<QVDPlugInCache> weakCache = cache_;
-  // The delegate is told after the drop, from the database queue: it only
-  // starts the termination of the plug-ins' processes, whose replies and
-  // wait run on queues of their own, so nothing waits on this queue.
-  std::weak_ptr<DelegateSlot> weakDelegate = delegate_;
-  registry_->addUninstallObserver([weakCache, weakDelegate](
-                                      const platform::holvane::PlugInRecord& record) {
-    const std::shared_ptr<QVDPlugInCache> cache = weakCache.lock();
-    if (!cache) return;
-    cache->queue()->async([weakCache, weakDelegate, record] {
-      if (auto alive = weakCache.lock()) alive->remove(record.uuid);
-      const std::shared_ptr<DelegateSlot> slot = weakDelegate.lock();
-      std::shared_ptr<QVDatabaseDelegate> delegate;
-      if (slot) {
-        std::lock_guard<std::mutex> lock(slot->mu);
-        delegate = slot->delegate.lock();
-      }
-      if (delegate) delegate->removedPlugIns({record});
-    });
-  });
 
   // Names are localized when a plug-in object is built, so a new locale
   // makes every cached object stale. The notice is delivered on the

@@ -117,6 +117,15 @@ class QVDatabase {
   std::optional<std::vector<std::shared_ptr<QVDPlugIn>>> plugInsWithinApplication(
       std::string_view url);
 
+  // ---- Installation (QVDatabaseInstallation.cpp) ----
+
+  // Has the registration service register (or deregister) the bundle at
+  // the file URL `url`. None on success, else a code-2 error. Runs on the
+  // caller's queue and leaves the cache alone: it follows the service's
+  // uninstall notices and the next look-ups.
+  std::optional<platform::Error> addPlugIn(std::string_view url);
+  std::optional<platform::Error> removePlugIn(std::string_view url);
+
   // ---- Annotations (QVDatabaseAnnotations.cpp) ----
 
   // The plug-in's stored annotation, or none. REQUIRES: not on syncQueue().
@@ -166,6 +175,14 @@ class QVDatabase {
   platform::Status initDatabase(std::optional<std::string> databasePath, const Platform& services);
 
  private:
+  struct DelegateSlot;
+  // Logs what the registration service installed, and drops what it is
+  // about to uninstall from the cache before telling the delegate.
+  void observeInstallations();
+  static void pluginsDidInstall(const std::vector<platform::holvane::PlugInRecord>& records);
+  static void pluginsWillUninstall(const std::vector<platform::holvane::PlugInRecord>& records,
+                                   const std::weak_ptr<QVDPlugInCache>& cache,
+                                   const std::weak_ptr<DelegateSlot>& delegate);
   // Runs on sync_: the valid cached entry of `uuid`, else the key is
   // dropped and none answered.
   std::shared_ptr<QVDPlugIn> cachedOnQueue(const platform::Uuid& uuid);

@@ -116,8 +116,6 @@ class Transaction : public std::enable_shared_from_this<Transaction> {
 
  private:
   Transaction(const platform::mbx::Message& request, std::shared_ptr<QVDMbxClient> client);
-  // The handler of a request whose implementation has not landed.
-  void notYetServed();
 
   const std::shared_ptr<QVDMbxClient> client_;
   const platform::Dictionary request_;

@@ -25,7 +25,8 @@ Platform FakePlatform::platform() const {
   return Platform{.entitlements = entitlements, .sandbox = sandbox, .preferences = preferences,
                   .notifications = notifications, .containers = containers, .registry = registry,
                   .locale = locale, .extensions = extensions, .types = types,
-                  .serviceManager = serviceManager, .assertions = assertions};
+                  .serviceManager = serviceManager, .assertions = assertions,
+                  .consents = consents};
 }
 
 bool eventually(const std::function<bool()>& done, std::chrono::milliseconds limit) {

@@ -7,6 +7,7 @@
 #include <chrono>
 #include <memory>
 #include <mutex>
+#include <ostream>
 #include <string>
 #include <vector>
 
@@ -18,6 +19,7 @@
 #include "platform/mbx/Connection.h"
 #include "platform/notify/testing/FakeNotificationCenter.h"
 #include "platform/prefs/testing/FakePreferenceStore.h"
+#include "platform/pvg/testing/FakeConsentService.h"
 #include "platform/sandbox/testing/FakeSandboxCheck.h"
 #include "platform/sandbox/testing/FakeSandboxExtensions.h"
 #include "platform/types/testing/FakeTypeRegistry.h"
@@ -53,6 +55,8 @@ struct FakePlatform {
       std::make_shared<platform::lumend::FakeServiceManager>();
   std::shared_ptr<platform::vouchd::FakeAssertionService> assertions =
       std::make_shared<platform::vouchd::FakeAssertionService>();
+  std::shared_ptr<platform::pvg::FakeConsentService> consents =
+      std::make_shared<platform::pvg::FakeConsentService>();
   Platform platform() const;
 };
 
@@ -109,6 +113,7 @@ struct ErrorReply {
   std::string message;
   bool operator==(const ErrorReply&) const = default;
 };
+inline void PrintTo(const ErrorReply& e, std::ostream* os) { *os << e.code << " \"" << e.message << "\""; }
 ErrorReply errorOf(const platform::Value& reply);
 
 }  // namespace qvd::testing
