@@ -29,6 +29,10 @@ int LinuxServiceManager::addExternalService(int hostPid, const std::string& exec
   if (executablePath.empty() || executablePath.front() != '/') return EINVAL;
   Result<bundle::Bundle> around =
       bundle::Bundle::create(executablePath, bundle::BundlePathKind::Executable);
+  // A bundle without an executable of its own is enabled by its directory.
+  if (around.ok() && !around->bundleDirectory()) {
+    around = bundle::Bundle::create(executablePath, bundle::BundlePathKind::Directory);
+  }
   const Dictionary* info = around.ok() ? around->infoDictionary() : nullptr;
   const std::string* identifier = info ? info->get("BXBundleIdentifier").string() : nullptr;
   if (identifier == nullptr || !internal::isRecordableBundleIdentifier(*identifier)) {

@@ -139,6 +139,10 @@ TEST_F(ServiceManagerTest, RecordsOfExternalServicesAreWrittenAndDropped) {
   EXPECT_EQ(*written,
             platform::Value(Dictionary{{"executable", executable}, {"overlay", overlay}}));
 
+  // A bundle without an executable is named by its directory.
+  EXPECT_EQ(lumend.addExternalService(
+                ::getpid(), std::filesystem::path(executable).parent_path().string(), overlay),
+            0);
   EXPECT_EQ(lumend.addExternalService(::getpid(), dir_ / "loose", overlay), EINVAL)
       << "an executable in no bundle";
   EXPECT_EQ(lumend.addExternalService(::getpid(), "relative/Plug", overlay), EINVAL);
