@@ -2,6 +2,7 @@
 
 #include <errno.h>
 #include <signal.h>
+#include <sys/stat.h>
 
 #include <utility>
 #include <vector>
@@ -27,12 +28,13 @@ int LinuxServiceManager::addExternalService(int hostPid, const std::string& exec
   if (hostPid <= 0) return ESRCH;
   if (::kill(hostPid, 0) != 0 && errno == ESRCH) return ESRCH;
   if (executablePath.empty() || executablePath.front() != '/') return EINVAL;
-  Result<bundle::Bundle> around =
-      bundle::Bundle::create(executablePath, bundle::BundlePathKind::Executable);
-  // A bundle without an executable of its own is enabled by its directory.
-  if (around.ok() && !around->bundleDirectory()) {
-    around = bundle::Bundle::create(executablePath, bundle::BundlePathKind::Directory);
-  }
+  // A bundle without an executable of its own is enabled by its directory,
+  // which must name that bundle, not one around it (an application's).
+  struct stat status;
+  const bool directory = ::stat(executablePath.c_str(), &status) == 0 && S_ISDIR(status.st_mode);
+  Result<bundle::Bundle> around = bundle::Bundle::create(
+      executablePath,
+      directory ? bundle::BundlePathKind::Directory : bundle::BundlePathKind::Executable);
   const Dictionary* info = around.ok() ? around->infoDictionary() : nullptr;
   const std::string* identifier = info ? info->get("BXBundleIdentifier").string() : nullptr;
   if (identifier == nullptr || !internal::isRecordableBundleIdentifier(*identifier)) {
