@@ -24,10 +24,6 @@ using platform::Uuid;
 using platform::Value;
 using platform::holvane::PlugInRecord;
 
-std::string selfExecutable() {
-  return std::filesystem::read_symlink("/proc/self/exe").string();
-}
-
 struct Bundle {
   std::string name;
   std::string point = "com.example.point";

@@ -25,10 +25,6 @@ using platform::holvane::Volume;
 
 std::string K(std::string_view key) { return std::string(key); }
 
-std::string selfExecutable() {
-  return std::filesystem::read_symlink("/proc/self/exe").string();
-}
-
 // What one plug-in of a test looks like.
 struct Spec {
   std::string name{};  // also the bundle name; identifier com.example.<id or name>

@@ -2,6 +2,7 @@
 
 #include <stdlib.h>
 
+#include <filesystem>
 #include <thread>
 
 #include "Quorvex/QVDConstants.h"
@@ -19,6 +20,10 @@ const std::string& testRoot() {
     return path;
   }();
   return root;
+}
+
+std::string selfExecutable() {
+  return std::filesystem::read_symlink("/proc/self/exe").string();
 }
 
 Platform FakePlatform::platform() const {

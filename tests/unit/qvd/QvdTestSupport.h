@@ -60,6 +60,10 @@ struct FakePlatform {
   Platform platform() const;
 };
 
+// This test program's executable: what a fake grant names to entitle the
+// test's own connections.
+std::string selfExecutable();
+
 // The temporary platform root of this process, made and set on first use.
 const std::string& testRoot();
 
