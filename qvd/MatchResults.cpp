@@ -29,8 +29,8 @@ std::string versionText(const QVDPlugIn& plugIn) {
 MatchResults::MatchResults(std::uint64_t flags, std::shared_ptr<const Transaction> transaction)
     : flags_(flags),
       transaction_(std::move(transaction)),
-      queue_(platform::dispatch::SerialQueue::create("com.corvane.qvd.postExporting",
-                                                     platform::dispatch::Priority::UserInitiated)) {}
+      queue_(platform::dispatch::SerialQueue::create(
+          "com.corvane.qvd.postExporting", platform::dispatch::Priority::UserInitiated)) {}
 
 bool MatchResults::preferred(const QVDPlugIn& plugIn, const platform::Dictionary& kept) {
   const bool keptOnSystem = kept.get(QVFormSystemResidentKey).boolean().value_or(false);

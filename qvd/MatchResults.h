@@ -10,8 +10,8 @@
 
 #include <cstdint>
 #include <map>
-#include <optional>
 #include <memory>
+#include <optional>
 #include <string>
 #include <unordered_map>
 #include <vector>
@@ -36,9 +36,7 @@ class MatchResults {
   MatchResults(std::uint64_t flags, std::shared_ptr<const Transaction> transaction);
 
   // "com.corvane.qvd.postExporting", made for this request.
-  const std::shared_ptr<platform::dispatch::SerialQueue>& postExportQueue() const {
-    return queue_;
-  }
+  const std::shared_ptr<platform::dispatch::SerialQueue>& postExportQueue() const { return queue_; }
 
   // Merges the exported `form` of `plugIn`: applies the version-duplicate
   // rule against the forms kept so far, then (when kept) adds the

@@ -62,8 +62,9 @@ std::string QVDPlugIn::sandboxProfile() const {
     // A keyboard that asks for open access gets the ordinary plug-in
     // profile, with its network, only once the user has consented for the
     // application that ships it.
-    const bool openAccess = attribute("RequestsOpenAccess") == platform::Value(true);
-    if (openAccess && allowedPVGServices().contains(std::string(platform::pvg::kPVGServiceKeyboardNetwork))) {
+    const bool openAccess = attribute("RequestsOpenAccess").boolean().value_or(false);
+    if (openAccess &&
+        allowedPVGServices().contains(std::string(platform::pvg::kPVGServiceKeyboardNetwork))) {
       return "plugin";
     }
     return "keyboard";
@@ -87,8 +88,8 @@ std::set<std::string> QVDPlugIn::allowedPVGServices() const {
   // A Bundle reads its manifest when made, so a new one is as fresh as a
   // flushed cache.
   platform::Result<platform::bundle::Bundle> application =
-      applicationPath ? platform::bundle::Bundle::create(*applicationPath,
-                                                         platform::bundle::BundlePathKind::Directory)
+      applicationPath ? platform::bundle::Bundle::create(
+                            *applicationPath, platform::bundle::BundlePathKind::Directory)
                       : platform::Result<platform::bundle::Bundle>(
                             platform::Error::posix(EINVAL, "not a file URL"));
   if (!application.ok() || !application->bundleDirectory()) {
@@ -154,26 +155,26 @@ std::optional<platform::Error> QVDPlugIn::enableForClient(
 
   const platform::Dictionary overlay{{std::string(kServiceKey), std::move(service)},
                                      {"BXBundlePackageType", "MBX!"}};
-  QVLogOps().notice("allowing host %d %@ to use plug-in %@(%@) uuid=%{public}@ at %@",
-                    client.pid(), client.path(), identifier, version, uuid, bundlePath);
+  QVLogOps().notice("allowing host %d %@ to use plug-in %@(%@) uuid=%{public}@ at %@", client.pid(),
+                    client.path(), identifier, version, uuid, bundlePath);
 
   const std::shared_ptr<QVBundle> bundle = url() ? QVBundle::initWithURL(*url()) : nullptr;
   const std::optional<std::string> executable = bundle ? bundle->executablePath() : std::nullopt;
   if (!executable) {
     QVLogOps().error("failed to obtain execPath for plug-in %@(%{public}@) bundle=%@", identifier,
                      uuid, bundle ? bundle->description() : bundlePath);
-    return QVErrorWithCodeMessage(QVErrorInvalidRequest,
-                                  "cannot obtain executable path for plug-in " + identifier + "(" +
-                                      uuid + ")");
+    return QVErrorWithCodeMessage(
+        QVErrorInvalidRequest,
+        "cannot obtain executable path for plug-in " + identifier + "(" + uuid + ")");
   }
   QVLogOps().debug("activation overlay=%@", platform::Value(overlay));
-  const int result = services_.serviceManager
-                         ? services_.serviceManager->addExternalService(client.pid(), *executable,
-                                                                        overlay)
-                         : ENOSYS;
+  const int result = services_.serviceManager ? services_.serviceManager->addExternalService(
+                                                    client.pid(), *executable, overlay)
+                                              : ENOSYS;
   if (result != 0) {
-    QVLogOps().error("lumend error %d trying to allow %d %@ to use plug-in %@(%@) uuid=%{public}@ at %@",
-                     result, client.pid(), client.path(), identifier, version, uuid, bundlePath);
+    QVLogOps().error(
+        "lumend error %d trying to allow %d %@ to use plug-in %@(%@) uuid=%{public}@ at %@", result,
+        client.pid(), client.path(), identifier, version, uuid, bundlePath);
     return QVErrorWithCodeMessage(QVErrorInvalidRequest,
                                   "unable to enable plug-in " + identifier + "(" + uuid + ")");
   }

@@ -26,8 +26,7 @@ std::optional<platform::Error> QVDatabase::removePlugIn(std::string_view url) {
       path ? registry_->unregisterPlugIn(*path) : platform::Status(platform::Error::posix(EINVAL));
   if (removed.ok()) return std::nullopt;
   QVLogHV().info("deregistration of %@ refused: %@", url, removed.error());
-  return QVErrorWithCodeMessage(QVErrorRegistryFailure,
-                                "Holvane failed to deregister the plug-in");
+  return QVErrorWithCodeMessage(QVErrorRegistryFailure, "Holvane failed to deregister the plug-in");
 }
 
 void QVDatabase::observeInstallations() {

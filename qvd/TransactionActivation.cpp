@@ -51,9 +51,11 @@ void Transaction::readyPlugIns() {
     const std::string uuid = uuidText(*plugIn);
     probes::pluginReady(uuid);
     if (server()->holdOnPlugIn(*plugIn)) {
-      QVLogOps().notice("denied access to %d for plugin %{public}@(%{public}@): the plug-in is on hold",
-                        client_->pid(), identifier, uuid);
-      failMessage(QVErrorDenied, "access to plugin " + identifier + " denied: the plug-in is on hold");
+      QVLogOps().notice(
+          "denied access to %d for plugin %{public}@(%{public}@): the plug-in is on hold",
+          client_->pid(), identifier, uuid);
+      failMessage(QVErrorDenied,
+                  "access to plugin " + identifier + " denied: the plug-in is on hold");
       return false;
     }
     // A data plug-in has no executable to enable; it is not an error.

@@ -4,8 +4,8 @@
 // the request's own before the reply is written.
 #include <algorithm>
 #include <atomic>
-#include <thread>
 #include <string>
+#include <thread>
 #include <utility>
 #include <vector>
 
@@ -90,8 +90,8 @@ void Transaction::matchPlugIns() {
   const int pid = client_->pid();
   // Read once: every lookup re-reads the grants, and the host's do not
   // change in the middle of its request.
-  const platform::Dictionary hostEntitlements = all ? platform::Dictionary()
-                                                    : client_->entitlements();
+  const platform::Dictionary hostEntitlements =
+      all ? platform::Dictionary() : client_->entitlements();
   const std::optional<std::string> hostPlugIns =
       client_->bundle() ? client_->bundle()->plugInsPath() : std::nullopt;
   const auto exportQueue =
@@ -118,8 +118,7 @@ void Transaction::matchPlugIns() {
         std::optional<platform::Error> error;
         std::optional<platform::Dictionary> form = p->exportForm(&error);
         if (!form) {
-          QVLogOps().error("failed to export matching plug-in %{public}@: %{public}@",
-                           uuidText(*p),
+          QVLogOps().error("failed to export matching plug-in %{public}@: %{public}@", uuidText(*p),
                            error ? error->description() : std::string("unknown error"));
           exports->leave();
           continue;
@@ -187,7 +186,8 @@ void Transaction::matchPlugIns() {
     QVLogOps().info("Resulting plugin count: 0");
   } else if (QVLogOps().isEnabled(platform::log::Level::Info)) {
     platform::Array uuids;
-    for (const MatchResults::Form& form : results->matches()) uuids.append(form->get(QVFormUUIDKey));
+    for (const MatchResults::Form& form : results->matches())
+      uuids.append(form->get(QVFormUUIDKey));
     QVLogOps().info("Resulting plugin count: %u, UUIDs: %{public}@",
                     static_cast<unsigned>(uuids.size()), platform::Value(std::move(uuids)));
   }

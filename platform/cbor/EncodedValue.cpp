@@ -44,9 +44,8 @@ EncodedValue EncodedValue::array(std::span<const EncodedValue> elements) {
 
 Value EncodedValue::decode() const {
   // The bytes came from our own encoder, so only a limit can refuse them.
-  Result<Value> value = cbor::decode(bytes(), DecodeLimits{.maxBytes = size(),
-                                                           .maxDepth = 1024,
-                                                           .maxItems = size()});
+  Result<Value> value =
+      cbor::decode(bytes(), DecodeLimits{.maxBytes = size(), .maxDepth = 1024, .maxItems = size()});
   return value.ok() ? std::move(value).value() : Value();
 }
 

@@ -32,9 +32,9 @@ int LinuxServiceManager::addExternalService(int hostPid, const std::string& exec
   // which must name that bundle, not one around it (an application's).
   struct stat status;
   const bool directory = ::stat(executablePath.c_str(), &status) == 0 && S_ISDIR(status.st_mode);
-  Result<bundle::Bundle> around = bundle::Bundle::create(
-      executablePath,
-      directory ? bundle::BundlePathKind::Directory : bundle::BundlePathKind::Executable);
+  Result<bundle::Bundle> around =
+      bundle::Bundle::create(executablePath, directory ? bundle::BundlePathKind::Directory
+                                                       : bundle::BundlePathKind::Executable);
   const Dictionary* info = around.ok() ? around->infoDictionary() : nullptr;
   const std::string* identifier = info ? info->get("BXBundleIdentifier").string() : nullptr;
   if (identifier == nullptr || !internal::isRecordableBundleIdentifier(*identifier)) {

@@ -75,8 +75,7 @@ TEST(CborEncodedValues, FailuresNameTheFaultAndLeaveTheBufferAlone) {
   std::vector<std::uint8_t> out = before;
   const std::vector<EncodedEntry> good = {{"matches", encoded(sample(1))}};
   // A bad plain value, after the head and some entries were written.
-  Status status =
-      encodeMap(Dictionary{{"a", Value(1)}, {"b", Value(Array{Value()})}}, good, out);
+  Status status = encodeMap(Dictionary{{"a", Value(1)}, {"b", Value(Array{Value()})}}, good, out);
   ASSERT_FALSE(status.ok());
   EXPECT_EQ(errorCodeOf(status.error()), ErrorCode::kUnencodableValue);
   EXPECT_NE(status.error().description().find("(at /b/0)"), std::string::npos)

@@ -26,8 +26,8 @@ using platform::holvane::PlugInRecord;
 struct Bundle {
   std::string name;
   std::string point = "com.example.point";
-  Dictionary extension{};            // extra XOExtension entries
-  Dictionary service{};              // MBXService, when not empty
+  Dictionary extension{};  // extra XOExtension entries
+  Dictionary service{};    // MBXService, when not empty
   bool withContainer = true;
   std::optional<std::string> app{};  // containing application path
 };
@@ -39,7 +39,8 @@ class ActivationTest : public ::testing::Test {
   // A plug-in on disk (the executable is looked up there) and in the
   // fake registry.
   PlugInRecord put(const Bundle& b) {
-    const std::string base = b.app ? *b.app + "/PlugIns/" : platform::rootPath("System/Library/PlugIns/");
+    const std::string base =
+        b.app ? *b.app + "/PlugIns/" : platform::rootPath("System/Library/PlugIns/");
     const std::string path = base + b.name + "-" + Uuid::generate().toString() + ".ovx";
     std::filesystem::create_directories(path);
     Dictionary extension{{"XOExtensionPointIdentifier", b.point},
@@ -60,7 +61,8 @@ class ActivationTest : public ::testing::Test {
     r.identifier = "com.example." + b.name;
     r.originalIdentifier = r.identifier;
     r.bundleIdentifier = r.identifier;
-    if (b.withContainer) r.dataContainer = platform::rootPath("var/containers/Data/" + r.identifier);
+    if (b.withContainer)
+      r.dataContainer = platform::rootPath("var/containers/Data/" + r.identifier);
     r.volume = b.app ? platform::holvane::Volume::Other : platform::holvane::Volume::System;
     r.extensionPointName = b.point;
     r.containingApplicationPath = b.app;
@@ -69,7 +71,8 @@ class ActivationTest : public ::testing::Test {
     return r;
   }
 
-  Value ready(const std::vector<PlugInRecord>& plugIns, std::optional<Dictionary> environment = {}) {
+  Value ready(const std::vector<PlugInRecord>& plugIns,
+              std::optional<Dictionary> environment = {}) {
     Dictionary message = request(QVDReadyRequest);
     Array uuids;
     for (const PlugInRecord& r : plugIns) uuids.append(r.uuid);
@@ -99,9 +102,9 @@ class ActivationTest : public ::testing::Test {
 
 TEST_F(ActivationTest, TheOverlayMergesTheEnvironmentWithThePlugInsOwnVariablesLast) {
   grant({{std::string(QVEnvironmentProvisionEntitlement), true}});
-  const PlugInRecord r = put({.name = "env",
-                              .service = {{"EnvironmentVariables", Dictionary{{"TMPDIR", "/own"}}},
-                                          {"Label", "kept"}}});
+  const PlugInRecord r = put(
+      {.name = "env",
+       .service = {{"EnvironmentVariables", Dictionary{{"TMPDIR", "/own"}}}, {"Label", "kept"}}});
   const Dictionary host{{"HOME", "/host"}, {"TMPDIR", "/host/tmp"}, {"LANG", "de"}};
   EXPECT_EQ(errorOf(ready({r}, host)), ErrorReply{});
 
@@ -130,8 +133,7 @@ TEST_F(ActivationTest, TheSandboxProfileFollowsTheExtensionPointAndTheKeyboardCo
                   app + "/Info.vmap", Value(Dictionary{{"BXBundleIdentifier", "com.example.keys"}}),
                   platform::vmap::Format::Xml, platform::vmap::FileOps::real())
                   .ok());
-  const Dictionary openAccess{
-      {"XOExtensionAttributes", Dictionary{{"RequestsOpenAccess", true}}}};
+  const Dictionary openAccess{{"XOExtensionAttributes", Dictionary{{"RequestsOpenAccess", true}}}};
   const struct {
     Bundle bundle;
     const char* profile;
@@ -151,10 +153,12 @@ TEST_F(ActivationTest, TheSandboxProfileFollowsTheExtensionPointAndTheKeyboardCo
   // Once the user consents for the application, an open-access keyboard
   // runs in the ordinary profile.
   server_.fakes().consents->setRecords(
-      "com.example.keys", {{.service = std::string(platform::pvg::kPVGServiceKeyboardNetwork),
-                            .granted = true}});
-  EXPECT_EQ(errorOf(ready({put({.name = "k3", .point = "com.corvane.keyboard-service",
-                                .extension = openAccess, .app = app})})),
+      "com.example.keys",
+      {{.service = std::string(platform::pvg::kPVGServiceKeyboardNetwork), .granted = true}});
+  EXPECT_EQ(errorOf(ready({put({.name = "k3",
+                                .point = "com.corvane.keyboard-service",
+                                .extension = openAccess,
+                                .app = app})})),
             ErrorReply{});
   EXPECT_EQ(lastService().get("_SandboxProfile"), Value("plugin"));
 }
@@ -164,12 +168,14 @@ TEST_F(ActivationTest, ARefusalForOnePlugInEnablesNone) {
   // An environment without the entitlement is refused before any look-up.
   const std::size_t lookups = server_.fakes().registry->lookupCount();
   EXPECT_EQ(errorOf(ready({first}, Dictionary{})),
-            (ErrorReply{11, "Transmission of environment variables requires the "
-                            "com.corvane.developer.quorvex.provide-environment host entitlement"}));
+            (ErrorReply{11,
+                        "Transmission of environment variables requires the "
+                        "com.corvane.developer.quorvex.provide-environment host entitlement"}));
   EXPECT_EQ(server_.fakes().registry->lookupCount(), lookups);
 
   const PlugInRecord demanding =
-      put({.name = "demanding", .extension = {{std::string(QVHostEntitlementInfoKey), "com.example.flag"}}});
+      put({.name = "demanding",
+           .extension = {{std::string(QVHostEntitlementInfoKey), "com.example.flag"}}});
   const ErrorReply refused = errorOf(ready({first, demanding}));
   EXPECT_EQ(refused.code, 11u);
   EXPECT_EQ(refused.message.rfind("access to plugin com.example.demanding denied: ", 0), 0u)
@@ -185,9 +191,10 @@ TEST_F(ActivationTest, ARefusalForOnePlugInEnablesNone) {
   EXPECT_TRUE(additions().empty());
 
   // A data plug-in is skipped, and one listed twice is enabled once.
-  const PlugInRecord data = put({.name = "data",
-                                 .extension = {{"XOExtensionProtocol", std::string(QVDataProtocol)}},
-                                 .withContainer = false});
+  const PlugInRecord data =
+      put({.name = "data",
+           .extension = {{"XOExtensionProtocol", std::string(QVDataProtocol)}},
+           .withContainer = false});
   EXPECT_EQ(errorOf(ready({data, first, first})), ErrorReply{});
   ASSERT_EQ(additions().size(), 1u);
   EXPECT_EQ(additions()[0].executablePath, first.path + "/Run");
@@ -198,8 +205,8 @@ TEST_F(ActivationTest, ARefusingServiceManagerIsReportedWithThePlugIn) {
   // daemon.)
   const PlugInRecord fine = put({.name = "fine"});
   server_.fakes().serviceManager->setAdditionResult(ESRCH);
-  EXPECT_EQ(errorOf(ready({fine})),
-            (ErrorReply{4, "unable to enable plug-in com.example.fine(" + fine.uuid.toString() + ")"}));
+  EXPECT_EQ(errorOf(ready({fine})), (ErrorReply{4, "unable to enable plug-in com.example.fine(" +
+                                                       fine.uuid.toString() + ")"}));
 }
 
 TEST_F(ActivationTest, AccessHandsOutTokensInOrderAndStopsAtTheFirstFailure) {
