@@ -189,7 +189,8 @@ void Transaction::matchPlugIns() {
     for (const MatchResults::Form& form : results->matches())
       uuids.append(form->get(QVFormUUIDKey));
     QVLogOps().info("Resulting plugin count: %u, UUIDs: %{public}@",
-                    static_cast<unsigned>(uuids.size()), platform::Value(std::move(uuids)));
+                    static_cast<unsigned>(results->matches().size()),
+                    platform::Value(std::move(uuids)));
   }
   // The forms were encoded as they were merged; a version-2 request gets
   // none (their whole-value encoding is not defined for it), nor does a

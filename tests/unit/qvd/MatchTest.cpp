@@ -10,6 +10,8 @@
 
 #include "Quorvex/QVDConstants.h"
 #include "Quorvex/QVPlugInConstants.h"
+#include "platform/log/LogCaptureForTesting.h"
+#include "platform/log/LoggerRegistry.h"
 #include "platform/root/Root.h"
 #include "tests/unit/qvd/QvdTestSupport.h"
 
@@ -129,7 +131,19 @@ TEST_F(MatchTest, VersionTableForEveryFlagCombination) {
   const std::vector<std::string> newestOnly = {"a12", "new", "sys", "v10"};
   const std::vector<std::string> versions = {"a10", "a12", "new", "sys", "v10", "v9"};
   const std::vector<std::string> everything = {"a10", "a12", "app", "new", "old", "sys", "v10", "v9"};
-  EXPECT_EQ(sorted(names(0)), newestOnly);
+  {
+    platform::log::LoggerRegistry::shared().applyFilterForTesting("info");
+    platform::log::LogCaptureForTesting capture;
+    EXPECT_EQ(sorted(names(0)), newestOnly);
+    platform::log::LoggerRegistry::shared().reloadEnvironmentForTesting();
+    // The log names the plug-ins the reply holds, and how many.
+    const auto lines = capture.messages();
+    EXPECT_EQ(std::count_if(lines.begin(), lines.end(),
+                            [](const std::string& line) {
+                              return line.rfind("Resulting plugin count: 4, UUIDs: (", 0) == 0;
+                            }),
+              1);
+  }
   EXPECT_EQ(sorted(names(QVDiscoverKeepDuplicates)), newestOnly) << "0x4 alone does nothing";
   EXPECT_EQ(sorted(names(QVDiscoverKeepVersions)), versions);
   EXPECT_EQ(sorted(names(QVDiscoverKeepVersions | QVDiscoverKeepDuplicates)), everything);
