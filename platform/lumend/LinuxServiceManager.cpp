@@ -80,15 +80,25 @@ RemovalOutcome LinuxServiceManager::removeNow(const std::string& bundleIdentifie
       .maxProcesses = options_.maxProcesses};
   std::vector<internal::ProcessHandle> instances = internal::findInstances(scan);
   std::vector<internal::ProcessHandle> signalled;
+  int refusal = 0;
   for (internal::ProcessHandle& instance : instances) {
-    if (!instance.signal(SIGTERM)) continue;  // it ended on its own meanwhile
+    const int sent = instance.signal(SIGTERM);
+    if (sent == ESRCH) continue;  // it ended on its own meanwhile
+    if (sent != 0) {
+      // Still running, and out of reach: whoever waits for the removal
+      // must not be told that nothing ran.
+      lumendLog().error("cannot signal %d of %{public}s: %{errno}d", instance.pid(),
+                        bundleIdentifier, sent);
+      refusal = sent;
+      continue;
+    }
     lumendLog().info("sent SIGTERM to %d of %{public}s", instance.pid(), bundleIdentifier);
     signalled.push_back(std::move(instance));
   }
   outcome.signalled = signalled.size();
   if (internal::awaitExit(signalled, options_.exitGrace) > 0) {
     for (const internal::ProcessHandle& instance : signalled) {
-      if (instance.exited() || !instance.signal(SIGKILL)) continue;
+      if (instance.exited() || instance.signal(SIGKILL) != 0) continue;
       lumendLog().error("%d of %{public}s outlived SIGTERM; sent SIGKILL", instance.pid(),
                         bundleIdentifier);
       ++outcome.killed;
@@ -97,7 +107,7 @@ RemovalOutcome LinuxServiceManager::removeNow(const std::string& bundleIdentifie
   }
   outcome.recordsDropped = internal::dropServiceRecords(options_.recordsDirectory, bundleIdentifier,
                                                         options_.maxHostDirectories);
-  outcome.error = outcome.signalled > 0 ? 0 : ESRCH;
+  outcome.error = outcome.signalled > 0 ? 0 : refusal != 0 ? refusal : ESRCH;
   return outcome;
 }
 

@@ -31,8 +31,8 @@ ProcessHandle::~ProcessHandle() {
   if (fd_ >= 0) ::close(fd_);
 }
 
-bool ProcessHandle::signal(int number) const {
-  return ::syscall(SYS_pidfd_send_signal, fd_, number, nullptr, 0) == 0;
+int ProcessHandle::signal(int number) const {
+  return ::syscall(SYS_pidfd_send_signal, fd_, number, nullptr, 0) == 0 ? 0 : errno;
 }
 
 bool ProcessHandle::exited() const {

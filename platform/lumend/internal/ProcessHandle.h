@@ -30,8 +30,9 @@ class ProcessHandle {
 
   pid_t pid() const { return pid_; }
   int descriptor() const { return fd_; }
-  // True when the signal was delivered; false once the process has gone.
-  bool signal(int number) const;
+  // 0 when the signal was delivered; ESRCH once the process has gone, or
+  // the errno of the refusal (EPERM without the right to signal it).
+  int signal(int number) const;
   // True once the process has ended (a zombie counts as ended).
   bool exited() const;
 
