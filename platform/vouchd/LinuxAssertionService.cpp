@@ -43,10 +43,18 @@ enum class LockState { Held, Free, Unusable };
 // Whether another open file description holds an exclusive lock on the
 // entry: a shared lock can then not be had. The entry is never followed
 // through a link and never opened for writing.
-LockState lockStateOf(int directory, const char* name) {
+LockState lockStateOf(int directory, const char* name, const std::string& directoryPath) {
   const int fd =
       ::openat(directory, name, O_RDONLY | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY);
-  if (fd < 0) return LockState::Unusable;
+  if (fd < 0) {
+    // Gone meanwhile, or a link (never followed): nothing to say. Anything
+    // else means a busy plug-in may be taken for an idle one.
+    if (errno != ENOENT && errno != ELOOP) {
+      vouchdLog().error("cannot probe assertion %{public}s/%{public}s: %{errno}d", directoryPath,
+                        name, errno);
+    }
+    return LockState::Unusable;
+  }
   struct stat status {};
   LockState state = LockState::Unusable;
   if (::fstat(fd, &status) == 0 && S_ISREG(status.st_mode)) {
@@ -117,7 +125,7 @@ Status LinuxAssertionService::collect(const std::string& bundleIdentifier,
     }
     const std::optional<int> pid = pidFromName(name);
     if (!pid) continue;
-    if (lockStateOf(::dirfd(directory), entry->d_name) != LockState::Held) continue;
+    if (lockStateOf(::dirfd(directory), entry->d_name, path) != LockState::Held) continue;
     found.push_back(ExtensionInstance{
         *pid, Dictionary{{std::string(kInstanceBundleIdentifierKey), bundleIdentifier},
                          {std::string(kInstancePidKey), static_cast<std::int64_t>(*pid)}}});
