@@ -76,8 +76,8 @@ DaemonProcess::~DaemonProcess() {
   ::waitpid(pid_, nullptr, 0);
 }
 
-long DaemonProcess::residentBytes() const {
-  const std::string path = "/proc/" + std::to_string(pid_) + "/status";
+long DaemonProcess::residentBytesOf(pid_t pid) {
+  const std::string path = "/proc/" + std::to_string(pid) + "/status";
   std::FILE* status = std::fopen(path.c_str(), "r");
   if (status == nullptr) return -1;
   char line[256];

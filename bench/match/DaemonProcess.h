@@ -24,7 +24,9 @@ class DaemonProcess {
 
   pid_t pid() const { return pid_; }
   // Resident memory of the daemon, from /proc/<pid>/status; -1 if unknown.
-  long residentBytes() const;
+  long residentBytes() const { return residentBytesOf(pid_); }
+  // The resident set of process `pid` in bytes (VmRSS), or -1.
+  static long residentBytesOf(pid_t pid);
 
  private:
   explicit DaemonProcess(pid_t pid) : pid_(pid) {}

@@ -18,6 +18,7 @@
 
 #include "Quorvex/QVDConstants.h"
 #include "Quorvex/QVFileURL.h"
+#include "bench/match/DaemonProcess.h"
 #include "platform/dispatch/Semaphore.h"
 
 extern char** environ;
@@ -71,8 +72,8 @@ platform::Result<std::unique_ptr<Helper>> Helper::start(const std::vector<std::s
                                      O_WRONLY | O_CREAT | O_APPEND, 0644);
   }
   pid_t pid = -1;
-  const int spawned = ::posix_spawnp(&pid, args[0].c_str(), &actions, nullptr, argp.data(),
-                                     environ);
+  const int spawned =
+      ::posix_spawnp(&pid, args[0].c_str(), &actions, nullptr, argp.data(), environ);
   posix_spawn_file_actions_destroy(&actions);
   ::close(out[1]);
   if (spawned != 0) {
@@ -153,16 +154,7 @@ void setProcessAffinity(pid_t pid, const cpu_set_t& cpus) {
 }
 
 long residentBytes(pid_t pid) {
-  const std::string path = "/proc/" + std::to_string(pid) + "/status";
-  std::FILE* status = std::fopen(path.c_str(), "r");
-  if (status == nullptr) return -1;
-  char line[256];
-  long kib = -1;
-  while (std::fgets(line, sizeof line, status) != nullptr) {
-    if (std::sscanf(line, "VmRSS: %ld kB", &kib) == 1) break;
-  }
-  std::fclose(status);
-  return kib < 0 ? -1 : kib * 1024;
+  return bench::match::DaemonProcess::residentBytesOf(pid);
 }
 
 double cpuSeconds(pid_t pid) {
@@ -210,13 +202,14 @@ bool failed(const platform::Result<Value>& reply, const char* what) {
   return false;
 }
 
-}  // namespace
-
-bool findByUuid(QVDaemonClient& client, const platform::Uuid& uuid, Value* replyOut) {
+// Sends one find with `send` and waits for its answer: true when a form
+// came back (copied to `replyOut` when given).
+template <typename Send>
+bool findWith(const char* what, Value* replyOut, Send send) {
   platform::dispatch::Semaphore answered;
   bool found = false;
-  client.findPlugInByUUID(uuid, [&](const platform::Result<Value>& reply) {
-    if (!failed(reply, "find")) {
+  send([&](const platform::Result<Value>& reply) {
+    if (!failed(reply, what)) {
       const Dictionary* body = reply->dictionary();
       found = body != nullptr && body->get(QVDMatchesKey).dictionary() != nullptr;
       if (found && replyOut != nullptr) *replyOut = *reply;
@@ -227,19 +220,16 @@ bool findByUuid(QVDaemonClient& client, const platform::Uuid& uuid, Value* reply
   return found;
 }
 
+}  // namespace
+
+bool findByUuid(QVDaemonClient& client, const platform::Uuid& uuid, Value* replyOut) {
+  return findWith("find", replyOut, [&](auto handler) { client.findPlugInByUUID(uuid, handler); });
+}
+
 bool findByPath(QVDaemonClient& client, const std::string& bundlePath, Value* replyOut) {
-  platform::dispatch::Semaphore answered;
-  bool found = false;
-  client.findPlugInByPathURL(QVFileURLFromPath(bundlePath), [&](const platform::Result<Value>& reply) {
-    if (!failed(reply, "find by path")) {
-      const Dictionary* body = reply->dictionary();
-      found = body != nullptr && body->get(QVDMatchesKey).dictionary() != nullptr;
-      if (found && replyOut != nullptr) *replyOut = *reply;
-    }
-    answered.signal();
+  return findWith("find by path", replyOut, [&](auto handler) {
+    client.findPlugInByPathURL(QVFileURLFromPath(bundlePath), handler);
   });
-  answered.wait();
-  return found;
 }
 
 long match(QVDaemonClient& client, const Dictionary& rules, std::vector<platform::Uuid>* uuidsOut) {
@@ -297,7 +287,8 @@ void Table::row(std::string what, std::string figure, std::string against, std::
                 std::string verdict) {
   Row row{{std::move(what), std::move(figure), std::move(against), std::move(target),
            std::move(verdict)},
-          false, section_};
+          false,
+          section_};
   rows_.push_back(std::move(row));
 }
 
