@@ -29,10 +29,11 @@ using platform::lumend::ServiceManagerOptions;
 
 class ServiceManagerTest : public ::testing::Test {
  protected:
-  // Removal looks at every process of the system, so each test process
-  // uses identifiers of its own: tests may run side by side.
-  static std::string id(const std::string& name) {
-    return "com.example." + name + "." + std::to_string(::getpid());
+  // Removal looks at every process of the system, so each test uses
+  // identifiers of its own: tests run side by side, and a process id is
+  // reused soon enough in a long run to make it no name of its own.
+  std::string id(const std::string& name) const {
+    return "com.example." + name + "." + std::filesystem::path(dir_.path).filename().string();
   }
   // An executable in a bundle named `identifier` (one bundle per name).
   std::string executableOf(const std::string& identifier, const std::string& bundleName = "") {
