@@ -226,6 +226,10 @@ class QVDPlugIn final : public QVPlugInCore, public QVDAnnotated {
   void storeLocalizedFrom(LocalizedCache which,
                           const std::optional<platform::holvane::PlugInRecord>& record) const;
   std::optional<std::string> containingNameOf(const platform::holvane::PlugInRecord& record) const;
+  // Sets the form's service token: `remembered` when it holds one, else a
+  // new one, which it then holds.
+  void addServiceExtension(platform::Dictionary& form,
+                           std::optional<std::string>& remembered) const;
   std::string currentLocale() const;
   void logNoFreshProxy() const;
 
@@ -238,7 +242,22 @@ class QVDPlugIn final : public QVPlugInCore, public QVDAnnotated {
   mutable QVAtomicField<platform::Dictionary> actionNames_;
   mutable QVAtomicField<platform::Dictionary> infoVmap_;
   mutable QVAtomicField<platform::Uuid> hvKnowledgeUUID_;
+  // Tokens that name only what the registration fixes: the whole bundle and
+  // the service. A token is a signature over its subject, so issuing again
+  // in the same registration generation gives the same text; every find
+  // and match would otherwise resolve the bundle path and sign anew.
+  // Entries inside the bundle are always issued afresh: their links are
+  // checked each time.
+  struct IssuedTokens {
+    platform::Uuid generation;
+    std::optional<std::string> wholeBundle;
+    std::optional<std::string> service;
+  };
+  mutable QVAtomicField<IssuedTokens> issuedTokens_;
   mutable std::recursive_mutex lock_;
+  // The generation whose record named no containing application; guarded by
+  // lock_. The nil UUID when none did (no generation is nil).
+  mutable platform::Uuid noContainerAt_;
   // The lent record and the generation it is current at.
   mutable std::mutex lentLock_;
   mutable platform::Uuid lentGeneration_;

@@ -143,10 +143,19 @@ void QVDPlugIn::storeLocalizedFrom(LocalizedCache which,
 void QVDPlugIn::refreshLocalized(LocalizedCache which) const {
   const platform::Uuid generation = services_.registry->generation();
   std::lock_guard<std::recursive_mutex> hold(lock_);
-  // An empty cache is refetched whatever the stamp says.
-  if (hasLocalized(which) && isFresh(generation)) return;
+  // An empty cache is refetched whatever the stamp says, except a containing
+  // name found absent because the record names no application: the same
+  // generation has the same record, so a refetch could only find that again,
+  // and it would cost a registry query on every form of a standalone plug-in.
+  if (isFresh(generation)) {
+    if (hasLocalized(which)) return;
+    if (which == LocalizedCache::ContainingName && noContainerAt_ == generation) return;
+  }
   std::optional<PlugInRecord> fresh = getProxy();
   if (!fresh) logNoFreshProxy();
+  if (which == LocalizedCache::ContainingName) {
+    noContainerAt_ = fresh && !fresh->containingApplicationPath ? generation : platform::Uuid();
+  }
   storeLocalizedFrom(which, fresh);
   hvKnowledgeUUID_.store(generation);
 }

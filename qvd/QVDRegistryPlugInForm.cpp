@@ -12,15 +12,34 @@
 namespace qvd {
 
 void QVDPlugIn::augmentForm(platform::Dictionary& form) const {
+  const platform::Uuid generation = services_.registry->generation();
+  const std::shared_ptr<const IssuedTokens> remembered = issuedTokens_.load();
+  IssuedTokens issued;
+  if (remembered && remembered->generation == generation) issued = *remembered;
+  issued.generation = generation;
+  const bool hadWhole = issued.wholeBundle.has_value();
+  const bool hadService = issued.service.has_value();
+
   const std::optional<std::string> location = url();
   // An application extension shares its whole bundle, whatever it lists.
   const platform::Value resources = isAppExtension() ? platform::Value(platform::Array{"."})
                                                      : pluginKey(QVSharedResourcesInfoKey);
   if (!resources.isNone() && location) {
-    form.set(QVExtensionsFormKey,
-             issueResourceExtensions(*services_.extensions, resources, *location));
+    form.set(QVExtensionsFormKey, issueResourceExtensions(*services_.extensions, resources,
+                                                          *location, &issued.wholeBundle));
   }
-  if (isData()) return;
+  if (!isData()) addServiceExtension(form, issued.service);
+  if (issued.wholeBundle.has_value() != hadWhole || issued.service.has_value() != hadService) {
+    issuedTokens_.store(std::move(issued));
+  }
+}
+
+void QVDPlugIn::addServiceExtension(platform::Dictionary& form,
+                                    std::optional<std::string>& remembered) const {
+  if (remembered) {
+    form.set(QVServiceExtensionFormKey, *remembered);
+    return;
+  }
   const platform::Value identifierValue = infoKey(QVBundleIdentifierKey);
   const std::string* serviceName = identifierValue.string();
   if (serviceName == nullptr || serviceName->empty()) {
@@ -40,6 +59,7 @@ void QVDPlugIn::augmentForm(platform::Dictionary& form) const {
     return;
   }
   form.set(QVServiceExtensionFormKey, *token);
+  remembered = std::move(token).value();
 }
 
 platform::Dictionary QVDPlugIn::localizedStowageActionNamesForQVDict(

@@ -76,14 +76,13 @@ bool resolvesInsideBundle(const std::string& path, const std::string& bundlePath
   if (::realpath(bundlePath.c_str(), bundle) == nullptr) return false;
   const std::string_view inside(resolved);
   const std::string_view root(bundle);
-  return inside == root ||
-         (inside.size() > root.size() && inside.substr(0, root.size()) == root &&
-          (root == "/" || inside[root.size()] == '/'));
+  return inside == root || (inside.size() > root.size() && inside.substr(0, root.size()) == root &&
+                            (root == "/" || inside[root.size()] == '/'));
 }
 
 void logFailure(std::string_view path, std::string_view bundlePath, int err) {
-  QVLogOps().info("failed to make extension for %@ in plug-in at %@: %{public}s", path,
-                  bundlePath, Error::posix(err).description());
+  QVLogOps().info("failed to make extension for %@ in plug-in at %@: %{public}s", path, bundlePath,
+                  Error::posix(err).description());
 }
 
 }  // namespace
@@ -97,7 +96,8 @@ Result<std::string> issueFileExtension(const SandboxExtensions& extensions,
 
 Result<std::string> issueServiceExtension(const SandboxExtensions& extensions,
                                           std::string_view serviceName) {
-  Result<std::string> token = extensions.issueServiceExtension(QVServiceExtensionClass, serviceName);
+  Result<std::string> token =
+      extensions.issueServiceExtension(QVServiceExtensionClass, serviceName);
   if (token.ok()) {
     QVLogSandbox().debug("issued mach extension for %s -> %s", serviceName, *token);
   }
@@ -106,7 +106,8 @@ Result<std::string> issueServiceExtension(const SandboxExtensions& extensions,
 
 platform::Dictionary issueResourceExtensions(const SandboxExtensions& extensions,
                                              const platform::Value& entries,
-                                             std::string_view bundleURL) {
+                                             std::string_view bundleURL,
+                                             std::optional<std::string>* wholeBundle) {
   platform::Dictionary tokens;
   const std::optional<std::string> bundlePath = QVPathFromFileURL(bundleURL);
   // For the log only: a bundle URL that is no file URL is named as given.
@@ -123,9 +124,13 @@ platform::Dictionary issueResourceExtensions(const SandboxExtensions& extensions
     const std::string path = !bundlePath ? *entry
                              : whole     ? *bundlePath
                                          : appendComponent(*bundlePath, *entry);
-    if (!bundlePath || (!whole && (!staysInsideBundle(*entry) ||
-                                   !resolvesInsideBundle(path, *bundlePath)))) {
+    if (!bundlePath ||
+        (!whole && (!staysInsideBundle(*entry) || !resolvesInsideBundle(path, *bundlePath)))) {
       logFailure(path, bundleName, EINVAL);
+      continue;
+    }
+    if (whole && wholeBundle != nullptr && wholeBundle->has_value()) {
+      tokens.set(*entry, platform::Value(**wholeBundle));
       continue;
     }
     Result<std::string> token = issueForPath(extensions, path);
@@ -133,6 +138,7 @@ platform::Dictionary issueResourceExtensions(const SandboxExtensions& extensions
       logFailure(path, bundleName, platform::sandbox::sandboxErrno(token.error()));
       continue;
     }
+    if (whole && wholeBundle != nullptr) *wholeBundle = *token;
     tokens.set(*entry, platform::Value(std::move(token).value()));
   }
   return tokens;

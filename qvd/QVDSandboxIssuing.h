@@ -1,12 +1,13 @@
 // The daemon's side of sandbox extensions: it issues tokens for hosts (read
 // access to a plug-in's files, the right to look up its service) and never
-// consumes any. Issued tokens are neither remembered nor revoked.
+// consumes any. Issued tokens are never revoked.
 //
 // Thread safety: stateless functions; safe from any thread, as the
 // SandboxExtensions they are given is.
 #pragma once
 
 #include <cstddef>
+#include <optional>
 #include <string>
 #include <string_view>
 
@@ -40,9 +41,12 @@ platform::Result<std::string> issueServiceExtension(
 // token cannot be issued is logged (ops, info) and left out; so is one that
 // would leave the bundle (a ".." component) or names nothing (empty). A
 // leading '/' does not make an entry absolute: it is appended all the same.
-// Never fails; the map may be empty.
-platform::Dictionary issueResourceExtensions(
-    const platform::sandbox::SandboxExtensions& extensions, const platform::Value& entries,
-    std::string_view bundleURL);
+// Never fails; the map may be empty. `wholeBundle`, when given, is the
+// token of "." if it holds one (used instead of issuing), and receives the
+// one issued otherwise.
+platform::Dictionary issueResourceExtensions(const platform::sandbox::SandboxExtensions& extensions,
+                                             const platform::Value& entries,
+                                             std::string_view bundleURL,
+                                             std::optional<std::string>* wholeBundle = nullptr);
 
 }  // namespace qvd

@@ -42,8 +42,7 @@ std::shared_ptr<QVDServer> QVDServer::initForService(std::string serviceName,
                                                      std::optional<std::string> databasePath,
                                                      Platform platform, TerminationSignal signal) {
   auto server = std::make_shared<QVDServer>(std::move(serviceName), std::move(platform));
-  if (platform::Status status =
-          server->initDatabase(std::move(databasePath), server->platform_);
+  if (platform::Status status = server->initDatabase(std::move(databasePath), server->platform_);
       !status.ok()) {
     // Without a place for the user's choices the daemon does not run.
     const std::string* text = status.error().localizedDescription();
@@ -96,7 +95,9 @@ void QVDServer::forgetInstance() {
   gServer.reset();
 }
 
-void QVDServer::resetForTesting() { forgetInstance(); }
+void QVDServer::resetForTesting() {
+  forgetInstance();
+}
 
 void QVDServer::setTerminationActionForTesting(std::function<void()> action) {
   terminationAction_ = std::move(action);
@@ -121,7 +122,9 @@ void QVDServer::run() {
   ::_exit(0);
 }
 
-void QVDServer::resumeForTesting() { service_->resume(); }
+void QVDServer::resumeForTesting() {
+  service_->resume();
+}
 
 void QVDServer::terminate() {
   stop();
@@ -158,7 +161,10 @@ void QVDServer::stop() {
 
 void QVDServer::submitWork(std::function<void()> work, Submission submission) {
   if (submission == Submission::Asynchronous) {
-    mainQueue_->async(std::move(work));
+    // Requests come from their connection's event handler, which returns
+    // right after: its thread serves the queue next instead of waking
+    // another one, which would cost a thread switch per request.
+    mainQueue_->asyncAfterCaller(std::move(work));
     return;
   }
   QVLogOps().debug("submitting block to main queue synchronously");

@@ -226,6 +226,14 @@ bool findByUuid(QVDaemonClient& client, const platform::Uuid& uuid, Value* reply
   return findWith("find", replyOut, [&](auto handler) { client.findPlugInByUUID(uuid, handler); });
 }
 
+bool findByUuidSynchronously(QVDaemonClient& client, const platform::Uuid& uuid) {
+  return findWith("synchronous find", nullptr, [&](auto handler) {
+    Dictionary message = client.request(QVDFindRequest);
+    message.set(QVDUUIDKey, Value(uuid));
+    client.sendSynchronously(QVDSending::Synchronous, std::move(message), handler);
+  });
+}
+
 bool findByPath(QVDaemonClient& client, const std::string& bundlePath, Value* replyOut) {
   return findWith("find by path", replyOut, [&](auto handler) {
     client.findPlugInByPathURL(QVFileURLFromPath(bundlePath), handler);

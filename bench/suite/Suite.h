@@ -83,6 +83,9 @@ long openDescriptors(pid_t pid);
 bool findByUuid(QVDaemonClient& client, const platform::Uuid& uuid,
                 platform::Value* replyOut = nullptr);
 // "find" by the bundle's file URL.
+// The same find sent synchronously (QVDaemonClient::sendSynchronously):
+// the calling thread reads the reply itself, as a host that waits would.
+bool findByUuidSynchronously(QVDaemonClient& client, const platform::Uuid& uuid);
 bool findByPath(QVDaemonClient& client, const std::string& bundlePath,
                 platform::Value* replyOut = nullptr);
 // "match": the number of forms; -2 when the daemon refused because the
@@ -104,8 +107,8 @@ class Table {
   // the order of their numbers, whatever order they were measured in.
   void at(int section) { section_ = section; }
   void heading(std::string title);
-  void row(std::string what, std::string figure, std::string against = {},
-           std::string target = {}, std::string verdict = {});
+  void row(std::string what, std::string figure, std::string against = {}, std::string target = {},
+           std::string verdict = {});
   // "met" / "missed", counted for the summary line.
   std::string verdict(bool met);
   std::string markdown() const;

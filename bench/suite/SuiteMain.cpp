@@ -57,14 +57,14 @@ bool Suite::run() {
              grouped((static_cast<double>(cachedResident_ - idleResident_)) / kLarge) +
                  " bytes per cached plug-in");
   char perConnection[64];
-  std::snprintf(perConnection, sizeof perConnection, "%.1f KiB",
-                perConnection_ / 1024.0);
+  std::snprintf(perConnection, sizeof perConnection, "%.1f KiB", perConnection_ / 1024.0);
   table_.row("per idle connection (" + grouped(static_cast<double>(connections_)) +
                  " connected Unix sockets)",
              perConnection);
 
   table_.at(6);
-  table_.heading("6. start-up with 10,000 plug-ins (until the socket accepts and a find by path answers)");
+  table_.heading(
+      "6. start-up with 10,000 plug-ins (until the socket accepts and a find by path answers)");
   table_.row("first start, fresh root (registers every bundle)", duration(firstStart_), "",
              "< 10 s (bench/registry's)", table_.verdict(firstStart_ < 10));
   table_.row("restart, median of 5", duration(percentile(restarts_, 0.5)),
@@ -74,7 +74,10 @@ bool Suite::run() {
 }
 
 bool Suite::profile(const std::string& kind, double seconds) {
-  if (kind != "find" && kind != "match" && kind != "version" && kind != "annotate") return false;
+  if (kind != "find" && kind != "sync-find" && kind != "match" && kind != "version" &&
+      kind != "annotate") {
+    return false;
+  }
   if (!makeRoots(true)) return false;
   const SyntheticRoot& root = roots_.at(kLarge);
   if (kind == "annotate" && !seedAnnotations(root, kLarge)) return false;
@@ -90,6 +93,9 @@ bool Suite::profile(const std::string& kind, double seconds) {
     if (kind == "find") {
       const platform::Uuid& uuid = uuids_[random_() % uuids_.size()];
       samples.push_back(secondsOf([&] { ok = findByUuid(*session.client, uuid); }));
+    } else if (kind == "sync-find") {
+      const platform::Uuid& uuid = uuids_[random_() % uuids_.size()];
+      samples.push_back(secondsOf([&] { ok = findByUuidSynchronously(*session.client, uuid); }));
     } else if (kind == "match") {
       const Dictionary rules{
           {"XOExtensionPointName", SyntheticRoot::pointName(random_() % root.points())}};
@@ -122,7 +128,8 @@ int main(int argc, char** argv) {
   }
   const bool profiling = argc == 4 && std::strcmp(argv[1], "--profile") == 0;
   if (argc != 1 && !profiling) {
-    std::fprintf(stderr, "usage: bench_suite [--profile find|match|version|annotate SECONDS]\n");
+    std::fprintf(stderr,
+                 "usage: bench_suite [--profile find|sync-find|match|version|annotate SECONDS]\n");
     return 2;
   }
   // Before anything logs: the daemon's and the client's notices would

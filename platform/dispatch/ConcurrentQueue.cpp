@@ -29,6 +29,11 @@ void ConcurrentQueue::async(Closure work) {
   internal::ThreadPool::instance().post(priority(), std::move(work), this);
 }
 
+void ConcurrentQueue::asyncAfterCaller(Closure work) {
+  internal::ThreadPool::instance().post(priority(), std::move(work), this,
+                                        internal::Handoff::CallerComesBack);
+}
+
 void ConcurrentQueue::sync(Closure work) {
   internal::ScopedQueueFrame frame(this);
   work();

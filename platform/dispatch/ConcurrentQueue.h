@@ -19,6 +19,7 @@ class ConcurrentQueue final : public Queue {
   static std::shared_ptr<ConcurrentQueue> shared(Priority priority = Priority::Default);
 
   void async(Closure work) override;
+  void asyncAfterCaller(Closure work) override;
   // Runs `work` inline on the calling thread, with this queue current.
   void sync(Closure work) override;
 

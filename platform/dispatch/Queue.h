@@ -29,6 +29,16 @@ class Queue : public std::enable_shared_from_this<Queue> {
   // `work` ends the process.
   virtual void async(Closure work) = 0;
 
+  // async() for work posted as the last act of an event handler or a job,
+  // such as a request handed from its connection to the queue serving it.
+  // On a pool thread no other thread is woken for it: the calling thread
+  // takes it once it returns to the pool, unless an idle thread that wakes
+  // for something else gets there first. The hand-off then costs no thread
+  // switch. Off the pool (and on the main queue) this is async().
+  // REQUIRES: the caller returns to the pool after bounded work. Blocking
+  //           in between is allowed: the pool then wakes a thread for it.
+  virtual void asyncAfterCaller(Closure work) { async(std::move(work)); }
+
   // Runs `work` on this queue and returns when it has finished. Whether the
   // calling thread runs it or waits for another depends on the queue kind.
   // REQUIRES: for a serial or the main queue, the queue is not current

@@ -16,13 +16,22 @@ SerialQueue::SerialQueue(std::string_view label, Priority priority) : Queue(labe
 SerialQueue::~SerialQueue() = default;
 
 void SerialQueue::async(Closure work) {
+  enqueue(std::move(work), internal::Handoff::WakeIdle);
+}
+
+void SerialQueue::asyncAfterCaller(Closure work) {
+  // The pool ignores the hand-off for a caller that is not one of its threads.
+  enqueue(std::move(work), internal::Handoff::CallerComesBack);
+}
+
+void SerialQueue::enqueue(Closure work, internal::Handoff handoff) {
   {
     std::lock_guard<std::mutex> lock(mu_);
     items_.push_back(Item{std::move(work), nullptr});
     if (state_ != State::Idle) return;
     state_ = State::Scheduled;
   }
-  schedule(internal::Handoff::WakeIdle);
+  schedule(handoff);
 }
 
 void SerialQueue::schedule(internal::Handoff handoff) {

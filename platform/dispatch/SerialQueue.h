@@ -32,6 +32,7 @@ class SerialQueue final : public Queue {
   ~SerialQueue() override;
 
   void async(Closure work) override;
+  void asyncAfterCaller(Closure work) override;
   // REQUIRES: !isCurrent() (otherwise aborts: the queue would wait on itself).
   void sync(Closure work) override;
 
@@ -54,6 +55,7 @@ class SerialQueue final : public Queue {
   };
 
   SerialQueue(std::string_view label, Priority priority);
+  void enqueue(Closure work, internal::Handoff handoff);
   // Gives the queue a turn on the pool; `handoff` as for ThreadPool::post.
   void schedule(internal::Handoff handoff);
   // One turn: runs up to kBatchLimit items, then yields or goes idle.

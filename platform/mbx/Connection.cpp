@@ -36,14 +36,15 @@ unsigned long long ull(std::uint64_t value) {
 
 const char* connectionErrorName(ConnectionError error) {
   switch (error) {
-    case ConnectionError::Invalid: return "connection invalid";
-    case ConnectionError::TerminationImminent: return "termination imminent";
+    case ConnectionError::Invalid:
+      return "connection invalid";
+    case ConnectionError::TerminationImminent:
+      return "termination imminent";
   }
   return "unknown";
 }
 
-Connection::Connection(std::string_view serviceName,
-                       std::shared_ptr<internal::SocketHandle> socket,
+Connection::Connection(std::string_view serviceName, std::shared_ptr<internal::SocketHandle> socket,
                        std::shared_ptr<const PeerIdentity> peer, ConnectionLimits limits)
     : serviceName_(serviceName),
       serial_(gNextSerial.fetch_add(1, std::memory_order_relaxed) + 1),
@@ -58,7 +59,8 @@ Result<std::shared_ptr<Connection>> Connection::adopt(std::string_view serviceNa
                                                       std::shared_ptr<const PeerIdentity> peer,
                                                       const ConnectionLimits& limits) {
   auto socket = std::make_shared<internal::SocketHandle>(fd);
-  std::shared_ptr<Connection> connection(new Connection(serviceName, socket, std::move(peer), limits));
+  std::shared_ptr<Connection> connection(
+      new Connection(serviceName, socket, std::move(peer), limits));
   std::weak_ptr<Connection> weak = connection;
   // The source holds the connection weakly: only resume() keeps it alive on
   // its own, so a connection nobody resumed or kept goes away.
@@ -93,7 +95,12 @@ Connection::~Connection() {
   if (source_) source_->cancel();
   // Only a connection that was never resumed, or whose invalidation has run,
   // gets here; in the first case its requests and context are still held.
-  for (PendingReply& reply : pending_.takeAll()) {
+  std::vector<PendingReply> pending;
+  {
+    std::lock_guard<std::mutex> lock(pendingMu_);
+    pending = pending_.takeAll();
+  }
+  for (PendingReply& reply : pending) {
     std::move(reply).complete(makeError(ErrorCode::ConnectionInvalid, "connection destroyed"));
   }
   if (finalizer_) finalizer_(std::move(context_));
@@ -135,7 +142,9 @@ dispatch::FdSource::Readiness Connection::onReadable() {
     const int err = n < 0 ? errno : 0;
     if (err == EINTR) continue;
     if (err == EAGAIN || err == EWOULDBLOCK) return Readiness::Drained;
-    if (consumeReceived(n, err, chunk) == Received::Ended) return Readiness::Drained;
+    if (consumeReceived(n, err, chunk, PendingReply::Caller::ReturnsToPool) == Received::Ended) {
+      return Readiness::Drained;
+    }
     // A short read of a stream socket means it was emptied: whatever comes
     // next is a new arrival, and the source reports it.
     if (static_cast<std::size_t>(n) < sizeof chunk) return Readiness::Drained;
@@ -144,7 +153,8 @@ dispatch::FdSource::Readiness Connection::onReadable() {
   return Readiness::MayRemain;
 }
 
-Connection::Received Connection::consumeReceived(ssize_t n, int err, const std::uint8_t* bytes) {
+Connection::Received Connection::consumeReceived(ssize_t n, int err, const std::uint8_t* bytes,
+                                                 PendingReply::Caller reader) {
   QV_ASSERT_ON_QUEUE(queue_);
   if (invalidated_) return Received::Ended;
   if (cancelled_.load(std::memory_order_relaxed)) {
@@ -174,7 +184,7 @@ Connection::Received Connection::consumeReceived(ssize_t n, int err, const std::
       return Received::Ended;
     }
     if (!step.value().has_value()) break;
-    handleFrame(std::move(*step.value()));
+    handleFrame(std::move(*step.value()), reader);
     if (invalidated_) return Received::Ended;
   }
   return Received::More;
@@ -188,7 +198,7 @@ void Connection::logBrokenFrame(const Error& error) const {
                  fault ? frameFaultName(*fault) : "unknown", error);
 }
 
-void Connection::handleFrame(Frame frame) {
+void Connection::handleFrame(Frame frame, PendingReply::Caller reader) {
   switch (frame.kind) {
     case FrameKind::Message:
     case FrameKind::Request: {
@@ -205,7 +215,7 @@ void Connection::handleFrame(Frame frame) {
     case FrameKind::Reply: {
       std::optional<PendingReply> pending;
       {
-        std::lock_guard<std::mutex> lock(mu_);
+        std::lock_guard<std::mutex> lock(pendingMu_);
         pending = pending_.take(frame.inReplyTo);
       }
       if (!pending) {
@@ -213,8 +223,9 @@ void Connection::handleFrame(Frame frame) {
                        ull(frame.inReplyTo));
         return;
       }
-      std::move(*pending).complete(Message(std::move(frame.body), FrameKind::Reply,
-                                           frame.messageId, frame.inReplyTo, weak_from_this()));
+      std::move(*pending).complete(Message(std::move(frame.body), FrameKind::Reply, frame.messageId,
+                                           frame.inReplyTo, weak_from_this()),
+                                   reader);
       return;
     }
     case FrameKind::Goodbye:
@@ -237,6 +248,7 @@ void Connection::invalidate() {
     std::lock_guard<std::mutex> lock(mu_);
     state_ = State::Invalid;
     closing_ = true;
+    std::lock_guard<std::mutex> pendingLock(pendingMu_);
     pending = pending_.takeAll();
     output_.clear();
     socket = std::move(socket_);
@@ -301,7 +313,7 @@ std::size_t Connection::queuedOutputBytesForTesting() const {
 }
 
 std::size_t Connection::pendingReplyCountForTesting() const {
-  std::lock_guard<std::mutex> lock(mu_);
+  std::lock_guard<std::mutex> lock(pendingMu_);
   return pending_.size();
 }
 

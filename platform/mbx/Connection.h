@@ -169,8 +169,11 @@ class Connection : public std::enable_shared_from_this<Connection> {
   // the frames it completes, or ends the connection at EOF, on an error or on
   // a broken frame.
   enum class Received { More, Ended };
-  Received consumeReceived(ssize_t n, int err, const std::uint8_t* bytes);
-  void handleFrame(Frame frame);
+  // `reader` says who read the bytes: the event handler, which returns to
+  // the pool right after, or a synchronous waiter, which goes on waiting.
+  Received consumeReceived(ssize_t n, int err, const std::uint8_t* bytes,
+                           internal::PendingReply::Caller reader);
+  void handleFrame(Frame frame, internal::PendingReply::Caller reader);
   void logBrokenFrame(const platform::Error& error) const;
   void invalidate();
 
@@ -192,20 +195,24 @@ class Connection : public std::enable_shared_from_this<Connection> {
   std::atomic<bool> cancelled_{false};
 
   mutable std::mutex mu_;
-  State state_ = State::Suspended;          // guarded by mu_
-  bool closing_ = false;                    // guarded by mu_: no more output
+  State state_ = State::Suspended;                  // guarded by mu_
+  bool closing_ = false;                            // guarded by mu_: no more output
   std::shared_ptr<internal::SocketHandle> socket_;  // guarded by mu_
-  std::uint64_t lastSentId_ = 0;            // guarded by mu_
-  internal::OutputQueue output_;            // guarded by mu_
-  bool writeWatched_ = false;               // guarded by mu_: output is queued
-  internal::PendingReplies pending_;        // guarded by mu_
-  bool syncReader_ = false;                 // guarded by mu_: a sync waiter reads
+  std::uint64_t lastSentId_ = 0;                    // guarded by mu_
+  internal::OutputQueue output_;                    // guarded by mu_
+  bool writeWatched_ = false;                       // guarded by mu_: output is queued
+  // Its own lock, taken inside mu_ where both are held: the reader looks a
+  // reply up while a sender may hold mu_ across its write, and must not
+  // wait for that write to finish.
+  mutable std::mutex pendingMu_;
+  internal::PendingReplies pending_;  // guarded by pendingMu_
+  bool syncReader_ = false;           // guarded by mu_: a sync waiter reads
   // Read watching left off after a synchronous request (see ReadParking).
   bool readsParked_ = false;                              // guarded by mu_
   bool parkListed_ = false;                               // guarded by mu_
   std::chrono::steady_clock::time_point parkedAt_;        // guarded by mu_
-  std::shared_ptr<Connection> selfWhileActive_;  // guarded by mu_
-  std::shared_ptr<void> context_;           // guarded by mu_
+  std::shared_ptr<Connection> selfWhileActive_;           // guarded by mu_
+  std::shared_ptr<void> context_;                         // guarded by mu_
   std::function<void(std::shared_ptr<void>)> finalizer_;  // guarded by mu_
 };
 

@@ -7,9 +7,9 @@
 
 #include "platform/dispatch/ScopedBlockingCall.h"
 #include "platform/mbx/Connection.h"
-#include "platform/mbx/internal/ReadParking.h"
 #include "platform/mbx/MbxError.h"
 #include "platform/mbx/internal/MbxLog.h"
+#include "platform/mbx/internal/ReadParking.h"
 
 namespace platform::mbx {
 
@@ -128,6 +128,7 @@ Result<Message> Connection::sendWithReplySync(Value body) {
       // Decided together with giving up the role: an asynchronous request
       // made after this sees the parked state and unparks.
       std::lock_guard<std::mutex> lock(mu_);
+      std::lock_guard<std::mutex> pendingLock(pendingMu_);
       if (pending_.size() == 0 && state_ == State::Active && !closing_) {
         readsParked_ = true;
         parkedAt_ = std::chrono::steady_clock::now();
@@ -181,7 +182,9 @@ void Connection::readUntilDone(const SyncWaiter& waiter, int fd) {
     }
     // On the delivery queue (inline when it is idle), so that every event
     // keeps its place in the connection's order.
-    queue_->sync([this, n, err, &chunk] { (void)consumeReceived(n, err, chunk); });
+    queue_->sync([this, n, err, &chunk] {
+      (void)consumeReceived(n, err, chunk, PendingReply::Caller::Anyone);
+    });
   }
 }
 
@@ -192,16 +195,15 @@ void Connection::sendGoodbye() {
 
 Status Connection::sendReply(std::uint64_t requestId, Value body,
                              std::span<const cbor::EncodedEntry> encoded) {
-  Result<std::vector<std::uint8_t>> frame =
-      encodeFrame(FrameKind::Reply, requestId, body, encoded);
+  Result<std::vector<std::uint8_t>> frame = encodeFrame(FrameKind::Reply, requestId, body, encoded);
   if (!frame.ok()) {
-    mbxLog().error("%{public}s: reply to request %llu not sent: %@", description(),
-                   ull(requestId), frame.error());
+    mbxLog().error("%{public}s: reply to request %llu not sent: %@", description(), ull(requestId),
+                   frame.error());
     return frame.error();
   }
   if (Status sent = transmit(std::move(frame).value(), nullptr); !sent.ok()) {
-    mbxLog().debug("%{public}s: reply to request %llu dropped: %@", description(),
-                   ull(requestId), sent.error());
+    mbxLog().debug("%{public}s: reply to request %llu dropped: %@", description(), ull(requestId),
+                   sent.error());
   }
   return okStatus();
 }
@@ -209,15 +211,20 @@ Status Connection::sendReply(std::uint64_t requestId, Value body,
 Status Connection::transmit(std::vector<std::uint8_t> frame, PendingReply* pending) {
   std::lock_guard<std::mutex> lock(mu_);
   if (state_ == State::Invalid || closing_) return makeError(ErrorCode::ConnectionInvalid);
-  if (pending != nullptr && pending_.size() >= limits_.maxPendingReplies) {
-    return makeError(ErrorCode::TooManyPendingReplies,
-                     std::to_string(pending_.size()) + " awaited on " + description());
-  }
   // Ids are stamped under the lock that orders the writes, so they increase
   // on the wire whichever threads send.
-  const std::uint64_t id = ++lastSentId_;
-  setMessageId(frame, id);
-  if (pending != nullptr) pending_.add(id, std::move(*pending));
+  if (pending != nullptr) {
+    std::lock_guard<std::mutex> pendingLock(pendingMu_);
+    if (pending_.size() >= limits_.maxPendingReplies) {
+      return makeError(ErrorCode::TooManyPendingReplies,
+                       std::to_string(pending_.size()) + " awaited on " + description());
+    }
+    const std::uint64_t id = ++lastSentId_;
+    setMessageId(frame, id);
+    pending_.add(id, std::move(*pending));
+  } else {
+    setMessageId(frame, ++lastSentId_);
+  }
   std::size_t written = 0;
   if (output_.empty()) {
     // Nothing queued ahead: write now, on the caller's thread.

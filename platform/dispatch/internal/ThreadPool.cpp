@@ -89,7 +89,10 @@ void ThreadPool::post(Priority priority, Closure job, const Queue* runAs, Handof
     std::lock_guard<std::mutex> lock(mu_);
     queues_[priorityIndex(priority)].push_back(Job{std::move(job), runAs});
     ++ready_;
-    newThread = wakeOrGrowLocked(tOnPool ? handoff : Handoff::WakeIdle);
+    // A thread inside a blocking call does not come back when its caller
+    // returns: it goes on waiting.
+    const bool comesBack = tOnPool && tBlockingDepth == 0;
+    newThread = wakeOrGrowLocked(comesBack ? handoff : Handoff::WakeIdle);
   }
   if (newThread != 0) startWorker(newThread);
 }

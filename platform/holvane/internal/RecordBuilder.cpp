@@ -93,8 +93,8 @@ Dictionary RecordBuilder::mergedInfo(const Dictionary& info, const std::string& 
     if (!sdk.ok()) {
       // An unreadable SDK is not the same as none: say so, then store the
       // plug-in as it declares itself.
-      holvaneLog().error("%{public}@: cannot read SDK of \"%{public}@\": %{public}@", path,
-                         *point, sdk.error());
+      holvaneLog().error("%{public}@: cannot read SDK of \"%{public}@\": %{public}@", path, *point,
+                         sdk.error());
     } else if (*sdk) {
       merged = mergeDictionaryInto(**sdk, info);
     }
@@ -121,7 +121,8 @@ Result<BuiltRecords> RecordBuilder::build(std::string_view bundlePath) const {
   const std::string given(bundlePath);
   std::optional<std::string> canonical = canonicalBundlePath(bundlePath);
   if (!canonical) return refused(given, "not an absolute path");
-  Result<bundle::Bundle> made = bundle::Bundle::create(*canonical, bundle::BundlePathKind::Directory);
+  Result<bundle::Bundle> made =
+      bundle::Bundle::create(*canonical, bundle::BundlePathKind::Directory);
   if (!made.ok()) return refused(given, made.error().description());
   const bundle::Bundle& plugInBundle = *made;
   if (plugInBundle.bundleDirectory() != *canonical) return refused(given, "no bundle there");
@@ -146,8 +147,8 @@ Result<BuiltRecords> RecordBuilder::build(std::string_view bundlePath) const {
   record.identifier = *identifier;
   record.version = stringOf(*info, kBundleVersionKey);
   if (!record.version) record.version = stringOf(*info, kBundleShortVersionKey);
-  record.volume = record.path.starts_with(locations_.systemVolumePrefix()) ? Volume::System
-                                                                           : Volume::Other;
+  record.volume =
+      record.path.starts_with(locations_.systemVolumePrefix()) ? Volume::System : Volume::Other;
   if (std::optional<bundle::Bundle> app = plugInBundle.containingApplication()) {
     ApplicationRecord application;
     application.path = app->bundleDirectory().value_or("");
@@ -167,10 +168,13 @@ Result<BuiltRecords> RecordBuilder::build(std::string_view bundlePath) const {
   const Dictionary* plugIn = record.plugInDictionary();
   const Dictionary* attributes =
       plugIn ? plugIn->get(kExtensionAttributesKey).dictionary() : nullptr;
-  if (attributes != nullptr) record.extensionPointName = stringOf(*attributes, kExtensionPointNameKey);
-  const bool isData = plugIn != nullptr && plugIn->get(kExtensionProtocolKey) == Value(kDataProtocol);
+  if (attributes != nullptr)
+    record.extensionPointName = stringOf(*attributes, kExtensionPointNameKey);
+  const bool isData =
+      plugIn != nullptr && plugIn->get(kExtensionProtocolKey) == Value(kDataProtocol);
   if (!isData) {
-    if (!record.bundleIdentifier) return refused(given, "no BXBundleIdentifier for its data container");
+    if (!record.bundleIdentifier)
+      return refused(given, "no BXBundleIdentifier for its data container");
     Result<std::string> container = makeDataContainer(*record.bundleIdentifier);
     if (!container.ok()) return refused(given, container.error().description());
     record.dataContainer = std::move(container).value();
@@ -202,16 +206,23 @@ Result<std::string> RecordBuilder::makeDataContainer(std::string_view bundleIden
     return registryError(RegistryErrorCode::Refused,
                          "bundle identifier cannot name a data container: " + std::string(invalid));
   }
-  std::string path;
-  for (std::string_view part : {"var", "containers", "Data"}) {
-    path += "/";
-    path += part;
-    if (Status made = makeDirectory(locations_.root + path, 0755); !made.ok()) return made.error();
-  }
   const std::string container = locations_.dataContainers() + "/" + std::string(bundleIdentifier);
-  for (const std::string& directory : {container, container + "/tmp"}) {
-    if (Status made = makeDirectory(directory, 0700); !made.ok()) return made.error();
+  Status made = makeDirectory(container, 0700);
+  if (!made.ok() && made.error().code() == ENOENT) {
+    // Only the first container finds its parents missing: creating them for
+    // every bundle would double the system calls of a first start.
+    std::string path;
+    for (std::string_view part : {"var", "containers", "Data"}) {
+      path += "/";
+      path += part;
+      if (Status parent = makeDirectory(locations_.root + path, 0755); !parent.ok()) {
+        return parent.error();
+      }
+    }
+    made = makeDirectory(container, 0700);
   }
+  if (!made.ok()) return made.error();
+  if (Status tmp = makeDirectory(container + "/tmp", 0700); !tmp.ok()) return tmp.error();
   return container;
 }
 

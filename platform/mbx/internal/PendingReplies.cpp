@@ -4,15 +4,20 @@
 
 namespace platform::mbx::internal {
 
-void PendingReply::complete(Result<Message> outcome) && {
+void PendingReply::complete(Result<Message> outcome, Caller caller) && {
   if (!handler) return;
   if (!queue) {
     handler(std::move(outcome));
     return;
   }
-  queue->async([handler = std::move(handler), outcome = std::move(outcome)]() mutable {
+  dispatch::Closure work([handler = std::move(handler), outcome = std::move(outcome)]() mutable {
     handler(std::move(outcome));
   });
+  if (caller == Caller::ReturnsToPool) {
+    queue->asyncAfterCaller(std::move(work));
+  } else {
+    queue->async(std::move(work));
+  }
 }
 
 void PendingReplies::add(std::uint64_t id, PendingReply reply) {

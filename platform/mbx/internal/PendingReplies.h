@@ -24,8 +24,13 @@ struct PendingReply {
   std::shared_ptr<dispatch::Queue> queue;
   std::function<void(platform::Result<Message>)> handler;
 
+  // Who completes: a reader that returns to the pool right after (the
+  // handler's queue then waits for that thread instead of waking another),
+  // or any other code.
+  enum class Caller { Anyone, ReturnsToPool };
+
   // Hands `outcome` to the handler on its queue.
-  void complete(platform::Result<Message> outcome) &&;
+  void complete(platform::Result<Message> outcome, Caller caller = Caller::Anyone) &&;
 };
 
 class PendingReplies {

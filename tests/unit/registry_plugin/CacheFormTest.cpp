@@ -27,6 +27,41 @@ TEST_F(RegistryPlugInTest, NamesAreKeptUntilTheGenerationChanges) {
   EXPECT_EQ(plugIn->localizedName(), "Gezeigt");
 }
 
+// Without a containing application the name stays empty; asking again in
+// the same generation must not query the registry (every form asks), but a
+// new generation may bring an application along.
+TEST_F(RegistryPlugInTest, AnAbsentContainingNameIsAskedForOncePerGeneration) {
+  PlugInRecord r = record("System/P.plugin", "com.example.p");
+  std::shared_ptr<QVDPlugIn> plugIn = make(r);
+  ASSERT_NE(plugIn, nullptr);
+  EXPECT_EQ(plugIn->localizedContainingName(), "");
+  const std::size_t lookups = registry_->lookupCount();
+  EXPECT_EQ(plugIn->localizedContainingName(), "");
+  EXPECT_EQ(registry_->lookupCount(), lookups);
+
+  platform::holvane::ApplicationRecord app;
+  app.path = root_ + "/Applications/A.app";
+  app.info.set("BXBundleName", "Host");
+  registry_->putApplication(app);
+  PlugInRecord moved = r;
+  moved.containingApplicationPath = app.path;
+  registry_->put(moved);
+  EXPECT_EQ(plugIn->localizedContainingName(), "Host");
+}
+
+// A record that cannot be found is asked for again each time: the registry
+// may answer once it has caught up.
+TEST_F(RegistryPlugInTest, AContainingNameWithoutARecordIsAskedForEachTime) {
+  PlugInRecord r = record("System/P.plugin", "com.example.p");
+  std::shared_ptr<QVDPlugIn> plugIn = make(r);
+  ASSERT_NE(plugIn, nullptr);
+  registry_->failQueries(platform::Error::posix(EIO, "registry down"));
+  EXPECT_EQ(plugIn->localizedContainingName(), "");
+  const std::size_t lookups = registry_->lookupCount();
+  EXPECT_EQ(plugIn->localizedContainingName(), "");
+  EXPECT_GT(registry_->lookupCount(), lookups);
+}
+
 // A lent record stands in for the registry only while the registry is still
 // at the generation it was lent at, and only while its lender keeps it.
 TEST_F(RegistryPlugInTest, LentRecordsServeOnlyTheirGenerationAndTheirLender) {
@@ -113,6 +148,53 @@ TEST_F(RegistryPlugInTest, FormTokens) {
   EXPECT_TRUE(logged("failed to make mach extension for com.example.f in plug-in at " + r.path +
                          ": " + platform::Error::posix(EPERM).description(),
                      Level::Info, "ops"));
+}
+
+// Tokens that depend on the registration alone (the whole bundle, the
+// service) are issued once per generation; entries inside the bundle are
+// issued every time, and a failed issue is tried again.
+TEST_F(RegistryPlugInTest, RegistrationTokensAreIssuedOncePerGeneration) {
+  Dictionary pd = validPlugInDictionary();
+  pd.set("Shared", Array{".", "Resources/data"});
+  PlugInRecord r = record("System/T.plugin", "com.example.t", pd);
+  std::shared_ptr<QVDPlugIn> plugIn = make(r);
+  ASSERT_NE(plugIn, nullptr);
+  using Op = platform::sandbox::ExtensionOperation;
+  auto issuedOf = [&](std::size_t from) {
+    std::vector<std::string> subjects;
+    const auto all = extensions_->issued();
+    for (std::size_t i = from; i < all.size(); ++i) {
+      subjects.push_back((all[i].operation == Op::IssueService ? "service " : "file ") +
+                         all[i].subject);
+    }
+    return subjects;
+  };
+  Dictionary first;
+  plugIn->augmentForm(first);
+  EXPECT_EQ(issuedOf(0),
+            (std::vector<std::string>{"file " + r.path, "file " + r.path + "/Resources/data",
+                                      "service com.example.t"}));
+  std::size_t before = extensions_->issued().size();
+  Dictionary second;
+  plugIn->augmentForm(second);
+  EXPECT_EQ(second, first) << "the same tokens";
+  EXPECT_EQ(issuedOf(before), std::vector<std::string>{"file " + r.path + "/Resources/data"});
+
+  registry_->put(record("System/Other.plugin", "com.example.other"));
+  before = extensions_->issued().size();
+  extensions_->setFailure(Op::IssueService, EPERM);
+  Dictionary third;
+  plugIn->augmentForm(third);
+  EXPECT_EQ(issuedOf(before),
+            (std::vector<std::string>{"file " + r.path, "file " + r.path + "/Resources/data"}));
+  EXPECT_TRUE(third.get("service-extension").isNone());
+  extensions_->setFailure(Op::IssueService, 0);
+  before = extensions_->issued().size();
+  Dictionary fourth;
+  plugIn->augmentForm(fourth);
+  EXPECT_EQ(issuedOf(before), (std::vector<std::string>{"file " + r.path + "/Resources/data",
+                                                        "service com.example.t"}));
+  EXPECT_EQ(fourth, first);
 }
 
 }  // namespace
