@@ -85,8 +85,21 @@ std::optional<platform::Dictionary> QVPlugInCore::exportForm(
     return std::nullopt;
   }
 
+  // The name is read first: it decides the display name of the bundle info,
+  // which is then copied once. The other dictionaries are shared, not copied:
+  // every value of the form is immutable.
+  const std::optional<std::string> name = localizedName();
   platform::Dictionary bundleInfo = *info;
   bundleInfo.remove(QVBundleInfoVmapURLKey);
+  if (name) {
+    // Clients show the bundle's display name; give them the one for their
+    // language, in the form's copy only.
+    QVLogHV().debug("%s BundleInfo[BundleDisplayName] was %@", "-[QVPlugInCore export:]",
+                    bundleInfo.get(QVBundleDisplayNameKey));
+    bundleInfo.set(QVBundleDisplayNameKey, *name);
+    QVLogHV().debug("%s BundleInfo[BundleDisplayName] is %@", "-[QVPlugInCore export:]",
+                    bundleInfo.get(QVBundleDisplayNameKey));
+  }
   const platform::Value currentVersion = version();
 
   platform::Dictionary form;
@@ -98,36 +111,29 @@ std::optional<platform::Dictionary> QVPlugInCore::exportForm(
   form.set(QVFormOriginalIdentifierKey, *original);
   form.set(QVFormVersionKey,
            currentVersion.isNone() ? platform::Value(QVFormNoVersion) : currentVersion);
-  form.set(QVFormBundleInfoKey, bundleInfo);
-  form.set(QVFormInfoKey, *plugIn);
+  form.set(QVFormBundleInfoKey, std::move(bundleInfo));
+  form.set(QVFormInfoKey, platform::Value(plugIn));
   form.set(QVFormUUIDKey, identity->toString());
   form.set(QVFormLastModifiedKey, static_cast<std::int64_t>(lastModified()));
   const DictionaryRef notes = annotations();
-  form.set(QVAnnotationsFormKey, notes ? *notes : platform::Dictionary());
+  form.set(QVAnnotationsFormKey,
+           notes ? platform::Value(notes) : platform::Value(platform::Dictionary()));
 
-  if (const DictionaryRef granted = entitlements()) form.set(QVFormEntitlementsKey, *granted);
+  if (const DictionaryRef granted = entitlements()) {
+    form.set(QVFormEntitlementsKey, platform::Value(granted));
+  }
   if (const std::optional<std::string> container = containingPath()) {
     form.set(QVFormContainingPathKey, *container);
   }
-  if (const std::optional<std::string> name = localizedContainingName()) {
-    form.set(QVFormLocalizedContainingNameKey, *name);
+  if (const std::optional<std::string> containing = localizedContainingName()) {
+    form.set(QVFormLocalizedContainingNameKey, *containing);
   }
-  if (const std::optional<std::string> name = localizedName()) {
-    form.set(QVFormLocalizedNameKey, *name);
-    // Clients show the bundle's display name; give them the one for their
-    // language, in the form's copy only.
-    QVLogHV().debug("%s BundleInfo[BundleDisplayName] was %@", "-[QVPlugInCore export:]",
-                    bundleInfo.get(QVBundleDisplayNameKey));
-    bundleInfo.set(QVBundleDisplayNameKey, *name);
-    QVLogHV().debug("%s BundleInfo[BundleDisplayName] is %@", "-[QVPlugInCore export:]",
-                    bundleInfo.get(QVBundleDisplayNameKey));
-    form.set(QVFormBundleInfoKey, std::move(bundleInfo));
-  }
+  if (name) form.set(QVFormLocalizedNameKey, *name);
   if (const std::optional<std::string> name = localizedShortName()) {
     form.set(QVFormLocalizedShortNameKey, *name);
   }
   if (const DictionaryRef names = localizedStowageActionNames()) {
-    form.set(QVFormLocalizedStowageActionNamesKey, *names);
+    form.set(QVFormLocalizedStowageActionNamesKey, platform::Value(names));
   }
   return form;
 }

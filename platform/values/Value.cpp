@@ -80,6 +80,10 @@ Value::Value(Data d) : v_(std::make_shared<const Data>(std::move(d))) {}
 Value::Value(Array a) : v_(std::make_shared<const Array>(std::move(a))) {}
 Value::Value(Dictionary d) : v_(std::make_shared<const Dictionary>(std::move(d))) {}
 
+Value::Value(std::shared_ptr<const Dictionary> d) {
+  if (d) v_ = std::move(d);
+}
+
 ValueType Value::type() const {
   switch (v_.index()) {
     case 0: return ValueType::None;

@@ -69,6 +69,9 @@ class Value {
   Value(Uuid u) : v_(u) {}
   Value(Array a);
   Value(Dictionary d);
+  // Shares a dictionary that is already immutable, without copying it; a
+  // null pointer makes none.
+  explicit Value(std::shared_ptr<const Dictionary> d);
 
   ValueType type() const;
   bool isNone() const { return v_.index() == 0; }
