@@ -150,6 +150,13 @@ int Daemon::terminate() {
   return status;
 }
 
+void Daemon::kill() {
+  if (pid_ <= 0) return;
+  ::kill(pid_, SIGKILL);
+  ::waitpid(pid_, nullptr, 0);
+  pid_ = -1;
+}
+
 std::string Daemon::log() const { return readWhole(logPath_); }
 
 int Daemon::countLines(const std::string& text) const {

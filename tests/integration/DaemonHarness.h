@@ -46,6 +46,8 @@ class Daemon {
   bool waitUntilServing();
   // Sends SIGTERM and waits for the exit: its status, or -1.
   int terminate();
+  // Ends it with SIGKILL, as a crash would, and reaps it.
+  void kill();
   std::string log() const;
   // How many lines of the log contain `text`.
   int countLines(const std::string& text) const;
