@@ -42,8 +42,10 @@ pid_t spawn(std::vector<std::string> argv, std::vector<std::string> env, const s
   posix_spawn_file_actions_t actions;
   posix_spawn_file_actions_init(&actions);
   posix_spawn_file_actions_addopen(&actions, 0, "/dev/null", O_RDONLY, 0);
-  posix_spawn_file_actions_addopen(&actions, 1, outPath.c_str(), O_WRONLY | O_CREAT | O_TRUNC, 0600);
-  posix_spawn_file_actions_addopen(&actions, 2, errPath.c_str(), O_WRONLY | O_CREAT | O_TRUNC, 0600);
+  posix_spawn_file_actions_addopen(&actions, 1, outPath.c_str(), O_WRONLY | O_CREAT | O_TRUNC,
+                                   0600);
+  posix_spawn_file_actions_addopen(&actions, 2, errPath.c_str(), O_WRONLY | O_CREAT | O_TRUNC,
+                                   0600);
   // The child starts with no signal blocked, whatever this process blocks.
   posix_spawnattr_t attributes;
   posix_spawnattr_init(&attributes);
@@ -104,12 +106,13 @@ Finished runProcess(const std::vector<std::string>& argv, const std::string& roo
 }
 
 Daemon::Daemon(const TemporaryRoot& root, std::vector<std::string> arguments,
-               std::string serviceName)
+               std::string serviceName, DaemonLogging logging)
     : root_(root), serviceName_(std::move(serviceName)), logPath_(root / "qvd.log") {
   arguments.insert(arguments.begin(), QVD_PATH);
-  pid_ = spawn(arguments,
-               {"QV_ROOT=" + root.path(), "PATH=/usr/bin:/bin", "QV_LOG=debug", "QV_LOG_PRIVATE=1"},
-               root / "qvd.out", logPath_);
+  const std::string level = logging == DaemonLogging::Debug ? "QV_LOG=debug" : "QV_LOG=info";
+  pid_ =
+      spawn(arguments, {"QV_ROOT=" + root.path(), "PATH=/usr/bin:/bin", level, "QV_LOG_PRIVATE=1"},
+            root / "qvd.out", logPath_);
 }
 
 Daemon::~Daemon() {
@@ -157,7 +160,9 @@ void Daemon::kill() {
   pid_ = -1;
 }
 
-std::string Daemon::log() const { return readWhole(logPath_); }
+std::string Daemon::log() const {
+  return readWhole(logPath_);
+}
 
 int Daemon::countLines(const std::string& text) const {
   std::istringstream lines(log());

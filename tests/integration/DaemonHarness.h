@@ -36,11 +36,16 @@ class TemporaryRoot {
 // collects its output.
 Finished runProcess(const std::vector<std::string>& argv, const std::string& root);
 
-// A qvd process with its log (all levels, nothing redacted) in a file.
+// How much a test daemon logs: every level (for tests that read its debug
+// lines), or info and up, for runs whose debug lines would fill the disk.
+enum class DaemonLogging { Debug, Info };
+
+// A qvd process with its log (nothing redacted) in a file.
 class Daemon {
  public:
   Daemon(const TemporaryRoot& root, std::vector<std::string> arguments,
-         std::string serviceName = "com.corvane.quorvex.qvd");
+         std::string serviceName = "com.corvane.quorvex.qvd",
+         DaemonLogging logging = DaemonLogging::Debug);
   ~Daemon();
   // Waits until it accepts connections (false after 10 s or when it exited).
   bool waitUntilServing();
