@@ -11,6 +11,16 @@
 namespace qvd::integration {
 namespace {
 
+// Under AddressSanitizer (the daemon is built with the tests) freed blocks sit
+// in its quarantine, up to 256 MiB, whatever the daemon asks of glibc: the
+// resident set says nothing about what the daemon keeps. A body leaked per
+// request is then LeakSanitizer's to report, which fails the daemon's exit.
+#if defined(__SANITIZE_ADDRESS__)
+constexpr bool kResidentSetMeansWhatIsKept = false;
+#else
+constexpr bool kResidentSetMeansWhatIsKept = true;
+#endif
+
 TEST_F(HostileClientTest, BrokenFramesEndOnlyTheirConnection) {
   const std::vector<std::uint8_t> good = cborOf(Value(request(QVDMatchRequest)));
   const auto len = static_cast<std::uint32_t>(good.size());
@@ -128,7 +138,9 @@ TEST_F(HostileClientTest, ASixteenMiBRequestIsServedAndItsMemoryDoesNotAccumulat
   const long afterOne = settled();
   // Blocks of a body's size are mapped and unmapped, not kept by the
   // allocator: one request leaves less than a body's worth behind.
-  EXPECT_LT(afterOne - baseline, 16 * 1024) << baseline << " -> " << afterOne << " KiB";
+  if (kResidentSetMeansWhatIsKept) {
+    EXPECT_LT(afterOne - baseline, 16 * 1024) << baseline << " -> " << afterOne << " KiB";
+  }
   // Many leave a little more in the per-thread arenas, at a level that stops
   // rising: a body kept per request would add 16 MiB each time. (Before the
   // daemon set its mmap threshold, glibc kept them: 130-155 MiB.)
@@ -144,6 +156,10 @@ TEST_F(HostileClientTest, ASixteenMiBRequestIsServedAndItsMemoryDoesNotAccumulat
   const long early = peakOver(6);
   peakOver(10);
   const long late = peakOver(6);
+  if (!kResidentSetMeansWhatIsKept) {
+    EXPECT_TRUE(stillServing());
+    return;
+  }
   EXPECT_LT(std::max(early, late) - baseline, 48 * 1024)
       << baseline << " -> " << early << " -> " << late << " KiB";
   EXPECT_LT(late - early, 32 * 1024) << baseline << " -> " << early << " -> " << late << " KiB";
