@@ -25,7 +25,7 @@ using platform::Dictionary;
 using platform::Value;
 using platform::holvane::PlugInRecord;
 
-struct Spec {
+struct PlugInShape {
   std::string name;
   std::string identifier;
   std::string version = "1.0";
@@ -56,7 +56,7 @@ void writeApplication() {
   std::ofstream(app + "/Host") << "#!/bin/sh\n";
 }
 
-PlugInRecord writePlugIn(const Spec& s, int serial) {
+PlugInRecord writePlugIn(const PlugInShape& s, int serial) {
   const std::string path =
       (s.inApplication ? applicationPath() + "/PlugIns/"
                        : platform::rootPath("System/Library/PlugIns/")) + s.name + ".ovx";
@@ -101,7 +101,7 @@ PlugInRecord writePlugIn(const Spec& s, int serial) {
 std::vector<PlugInRecord> makePlugInCatalogue() {
   writeApplication();
   const Dictionary environment{{"TMPDIR", "/own"}, {"LANG", "C"}};
-  const std::vector<Spec> specs = {
+  const std::vector<PlugInShape> shapes = {
       {.name = "alpha", .identifier = "com.example.alpha",
        .entitlements = {{std::string(QVAutoElectEntitlement), true}},
        .service = {{"EnvironmentVariables", environment}, {"Label", "alpha"}}},
@@ -118,7 +118,7 @@ std::vector<PlugInRecord> makePlugInCatalogue() {
   };
   std::vector<PlugInRecord> records;
   int serial = 0;
-  for (const Spec& spec : specs) records.push_back(writePlugIn(spec, ++serial));
+  for (const PlugInShape& shape : shapes) records.push_back(writePlugIn(shape, ++serial));
   return records;
 }
 
