@@ -30,10 +30,10 @@ struct PlugInShape {
   std::string identifier;
   std::string version = "1.0";
   std::string point = "com.example.point";
-  Dictionary extension{};     // extra XOExtension entries
-  Dictionary attributes{};    // extra XOExtensionAttributes entries
+  Dictionary extension{};   // extra XOExtension entries
+  Dictionary attributes{};  // extra XOExtensionAttributes entries
   Dictionary entitlements{};
-  Dictionary service{};       // MBXService, when not empty
+  Dictionary service{};  // MBXService, when not empty
   bool inApplication = false;
   bool data = false;
 };
@@ -46,24 +46,25 @@ void writeOrDie(const std::string& path, const Value& value) {
   }
 }
 
-std::string applicationPath() { return platform::rootPath("Applications/Host.app"); }
+std::string applicationPath() {
+  return platform::rootPath("Applications/Host.app");
+}
 
 void writeApplication() {
   const std::string app = applicationPath();
   std::filesystem::create_directories(app + "/PlugIns");
-  writeOrDie(app + "/Info.vmap",
-             Value(Dictionary{{"BXBundleIdentifier", "com.example.host"}, {"BXExecutable", "Host"}}));
+  writeOrDie(app + "/Info.vmap", Value(Dictionary{{"BXBundleIdentifier", "com.example.host"},
+                                                  {"BXExecutable", "Host"}}));
   std::ofstream(app + "/Host") << "#!/bin/sh\n";
 }
 
 PlugInRecord writePlugIn(const PlugInShape& s, int serial) {
-  const std::string path =
-      (s.inApplication ? applicationPath() + "/PlugIns/"
-                       : platform::rootPath("System/Library/PlugIns/")) + s.name + ".ovx";
+  const std::string path = (s.inApplication ? applicationPath() + "/PlugIns/"
+                                            : platform::rootPath("System/Library/PlugIns/")) +
+                           s.name + ".ovx";
   std::filesystem::create_directories(path);
-  Dictionary attributes{{"XOExtensionPointName", s.point},
-                        {"XOExtensionVersion", s.version},
-                        {"Name", s.name}};
+  Dictionary attributes{
+      {"XOExtensionPointName", s.point}, {"XOExtensionVersion", s.version}, {"Name", s.name}};
   for (const auto& [key, value] : s.attributes) attributes.set(key, value);
   Dictionary extension{{"XOExtensionPointIdentifier", s.point},
                        {"XOExtensionAttributes", attributes}};
@@ -102,19 +103,27 @@ std::vector<PlugInRecord> makePlugInCatalogue() {
   writeApplication();
   const Dictionary environment{{"TMPDIR", "/own"}, {"LANG", "C"}};
   const std::vector<PlugInShape> shapes = {
-      {.name = "alpha", .identifier = "com.example.alpha",
+      {.name = "alpha",
+       .identifier = "com.example.alpha",
        .entitlements = {{std::string(QVAutoElectEntitlement), true}},
        .service = {{"EnvironmentVariables", environment}, {"Label", "alpha"}}},
-      {.name = "beta", .identifier = "com.example.beta", .version = "2.0",
+      {.name = "beta",
+       .identifier = "com.example.beta",
+       .version = "2.0",
        .extension = {{std::string(QVHostEntitlementInfoKey), "com.example.flag"}}},
-      {.name = "epsilon", .identifier = "com.example.alpha", .version = "0.9",
+      {.name = "epsilon",
+       .identifier = "com.example.alpha",
+       .version = "0.9",
        .entitlements = {{std::string(QVOverrideEntitlement), "com.example.beta"}}},
       {.name = "busy", .identifier = "com.example.busy"},
       {.name = "delta", .identifier = "com.example.delta", .data = true},
       {.name = "denied", .identifier = "com.example.denied", .point = "com.example.other"},
-      {.name = "gamma", .identifier = "com.example.gamma", .point = "com.corvane.keyboard-service",
+      {.name = "gamma",
+       .identifier = "com.example.gamma",
+       .point = "com.corvane.keyboard-service",
        .extension = {{std::string(QVDedicatedKey), true}},
-       .attributes = {{"RequestsOpenAccess", true}}, .inApplication = true},
+       .attributes = {{"RequestsOpenAccess", true}},
+       .inApplication = true},
   };
   std::vector<PlugInRecord> records;
   int serial = 0;
