@@ -22,16 +22,11 @@ constexpr bool kResidentSetMeansWhatIsKept = true;
 #endif
 
 TEST_F(HostileClientTest, BrokenFramesEndOnlyTheirConnection) {
+  // Each framing rule has its own case in the message system's tests; here a
+  // few of each family reach the real daemon, which must drop only the
+  // connection that broke one.
   const std::vector<std::uint8_t> good = cborOf(Value(request(QVDMatchRequest)));
   const auto len = static_cast<std::uint32_t>(good.size());
-  FrameHeader badMagic = header(1, 1, len);
-  badMagic.magic = {'Q', 'V', 'M', 'X'};
-  FrameHeader badVersion = header(1, 1, len);
-  badVersion.version = 2;
-  std::vector<std::uint8_t> trailing = good;
-  trailing.push_back(0x00);
-  std::vector<std::uint8_t> tooDeep(65, 0x81);  // 65 nested one-element arrays
-  tooDeep.push_back(0x01);
   std::vector<std::uint8_t> cutBody = rawFrame(header(1, 1, len), good);
   cutBody.resize(cutBody.size() - 5);
 
@@ -43,30 +38,13 @@ TEST_F(HostileClientTest, BrokenFramesEndOnlyTheirConnection) {
   };
   const std::vector<Case> cases = {
       {"four bytes of another protocol", {'G', 'E', 'T', ' '}, false, "bad magic"},
-      {"bad magic", rawFrame(badMagic, good), false, "bad magic"},
-      {"version 2", rawFrame(badVersion, good), false, "unknown frame version"},
-      {"flag 0x8", rawFrame(header(0x8, 1, len), good), false, "unknown flag bits"},
       {"flags 0x3", rawFrame(header(0x3, 1, len), good), false, "conflicting flags"},
-      {"message id 0", rawFrame(header(1, 0, len), good), false, "zero message id"},
       {"length 16 MiB + 1, header only", rawFrame(header(1, 1, (16u << 20) + 1), {}), false,
        "body length over the limit"},
-      {"in-reply-to on a request", rawFrame(header(1, 1, len, 7), good), false,
-       "in-reply-to on a frame that is no reply"},
-      {"goodbye with a body", rawFrame(header(0x4, 1, len), good), false, "goodbye with a body"},
-      {"reply to nothing", rawFrame(header(0x2, 1, len), good), false, "reply with in-reply-to 0"},
       {"body cut short, then end", cutBody, true, "stream ended inside a frame"},
-      {"header cut short, then end",
-       std::vector<std::uint8_t>(cutBody.begin(), cutBody.begin() + 10), true,
-       "stream ended inside a frame"},
-      {"break code", requestFrame({0xff}), false, "undecodable body"},
-      {"map cut short", requestFrame({0xa1, 0x61, 'a'}), false, "undecodable body"},
-      {"trailing byte", requestFrame(trailing), false, "undecodable body"},
       {"invalid UTF-8 key", requestFrame({0xa1, 0x62, 0xc3, 0x28, 0x00}), false,
        "undecodable body"},
-      {"integer key", requestFrame({0xa1, 0x01, 0x02}), false, "undecodable body"},
-      {"null", requestFrame({0xf6}), false, "undecodable body"},
       {"indefinite map", requestFrame({0xbf, 0xff}), false, "undecodable body"},
-      {"nesting 65", requestFrame(tooDeep), false, "undecodable body"},
   };
   for (const Case& c : cases) {
     SCOPED_TRACE(c.what);
