@@ -94,12 +94,13 @@ TemporaryRoot::~TemporaryRoot() {
   std::filesystem::remove_all(path_, ignored);
 }
 
-Finished runProcess(const std::vector<std::string>& argv, const std::string& root) {
+Finished runProcess(const std::vector<std::string>& argv, const std::string& root,
+                    std::chrono::seconds limit) {
   const std::string stem = root + "/.run-" + std::to_string(++gSerial);
   Finished finished;
   pid_t pid = spawn(argv, {"QV_ROOT=" + root, "PATH=/usr/bin:/bin"}, stem + ".out", stem + ".err");
   if (pid < 0) return finished;
-  finished.status = waitFor(pid, 10s);
+  finished.status = waitFor(pid, limit);
   finished.out = readWhole(stem + ".out");
   finished.err = readWhole(stem + ".err");
   return finished;

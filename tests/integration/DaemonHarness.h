@@ -32,9 +32,10 @@ class TemporaryRoot {
   std::string path_;
 };
 
-// Runs `argv` with QV_ROOT=root, waits for it (killed after 10 s) and
+// Runs `argv` with QV_ROOT=root, waits for it (killed after `limit`) and
 // collects its output.
-Finished runProcess(const std::vector<std::string>& argv, const std::string& root);
+Finished runProcess(const std::vector<std::string>& argv, const std::string& root,
+                    std::chrono::seconds limit = 10s);
 
 // How much a test daemon logs: every level (for tests that read its debug
 // lines), or info and up, for runs whose debug lines would fill the disk.
@@ -54,6 +55,7 @@ class Daemon {
   // Ends it with SIGKILL, as a crash would, and reaps it.
   void kill();
   std::string log() const;
+  pid_t pid() const { return pid_; }
   // How many lines of the log contain `text`.
   int countLines(const std::string& text) const;
 
