@@ -295,7 +295,7 @@ TEST_F(InstallationActivationTest, APlugInWithoutItsExecutableIsEnabledByItsOwnD
 }
 
 // The test process consumes the tokens as their host would.
-TEST_F(InstallationActivationTest, AccessTokensAreConsumableAndRefusedOnceAltered) {
+TEST_F(InstallationActivationTest, AccessTokensAreConsumableAndForgeriesAreRefused) {
   const PlugIn first = install("first");
   const PlugIn second = install("second");
   const Finished access =
@@ -322,14 +322,27 @@ TEST_F(InstallationActivationTest, AccessTokensAreConsumableAndRefusedOnceAltere
     EXPECT_TRUE(consumer.release(*handle).ok());
   }
 
-  // One character changed, in the path or in the signature.
+  // Forgeries: one character changed, in the path or in the signature; the
+  // first token's signature under the second's body; a token for /etc
+  // signed with a key the forger made (another root's).
   const std::string token = tokens[0];
+  const auto signatureOf = [](const std::string& t) { return t.substr(t.rfind(';')); };
+  const auto bodyOf = [](const std::string& t) { return t.substr(0, t.rfind(';')); };
+  std::vector<std::string> forged{bodyOf(tokens[1]) + signatureOf(token)};
   for (std::size_t at : {token.find(second.path) + second.path.size() - 1, token.size() - 1}) {
-    std::string altered = token;
-    altered[at] = altered[at] == 'a' ? 'b' : 'a';
-    auto handle = consumer.consume(altered);
-    ASSERT_FALSE(handle.ok()) << altered;
-    EXPECT_EQ(platform::sandbox::sandboxErrno(handle.error()), EPERM) << altered;
+    forged.push_back(token);
+    forged.back()[at] = forged.back()[at] == 'a' ? 'b' : 'a';
+  }
+  TemporaryRoot forgers;
+  platform::sandbox::LinuxSandboxExtensions forger(
+      forgers / std::string(platform::sandbox::kSigningKeyRelativePath));
+  auto own = forger.issueFileExtension("/etc", platform::sandbox::PathResolution::AsGiven);
+  ASSERT_TRUE(own.ok()) << own.error().description();
+  forged.push_back(*own);
+  for (const std::string& attempt : forged) {
+    auto handle = consumer.consume(attempt);
+    ASSERT_FALSE(handle.ok()) << attempt;
+    EXPECT_EQ(platform::sandbox::sandboxErrno(handle.error()), EPERM) << attempt;
   }
 }
 
