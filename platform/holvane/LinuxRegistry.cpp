@@ -116,6 +116,14 @@ Result<LinuxRegistry::StoreFile> LinuxRegistry::openStore() {
   const std::string path = locations_.database();
   StoreFile file = StoreFile::Existing;
   Result<std::unique_ptr<internal::RecordStore>> store = internal::RecordStore::open(path);
+  if (!store.ok() && !isRegistryError(store.error(), RegistryErrorCode::Corrupt)) {
+    // A full or failing disk says nothing about the file, and moving it
+    // aside would drop the write-ahead log with the changes committed
+    // there. The file is as good as before once the disk recovers.
+    holvaneLog().error("cannot open registration database %{public}@: %{public}@", path,
+                       store.error());
+    return store.error();
+  }
   if (!store.ok()) {
     holvaneLog().fault("registration database %{public}@ unusable, rebuilding it: %{public}@",
                        path, store.error());

@@ -1,8 +1,10 @@
 // The registration service on Linux: records in SQLite at
 // <root>/var/db/holvane/registry.sqlite, all database work on one serial
-// queue of its own ("com.corvane.holvane"). A database file that cannot be
-// read or is damaged is logged, moved aside and rebuilt by a registration
-// pass, so a bad file costs a rescan, never the service.
+// queue of its own ("com.corvane.holvane"). A damaged database file (not a
+// database, failing SQLite's quick check, or of an unknown schema) is
+// logged, moved aside and rebuilt by a registration pass, so a bad file
+// costs a rescan, never the service. A disk that fails to read or write a
+// good file is no sign of damage: the file is left as it is.
 //
 // Observers run on the registry's queue: install observers right after a
 // change is committed, uninstall observers before the record is removed.
@@ -40,7 +42,9 @@ class LinuxRegistry final : public Registry {
   // Opens (creating when missing) the database under `locations`. With
   // StartupScan::Run, and always after a damaged file was replaced, it then
   // registers the installed bundles and drops records whose bundle is gone.
-  // Fails only when no database can be made at all.
+  // Fails when the disk fails under the file (Storage; the file is left
+  // untouched for the next attempt), when no fresh database can be made, or
+  // when the registration pass cannot store what it found.
   // REQUIRES: sdks and entitlements are not null.
   static Result<std::shared_ptr<LinuxRegistry>> open(
       RegistryLocations locations, std::shared_ptr<const SdkRegistry> sdks,

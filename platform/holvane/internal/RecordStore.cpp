@@ -1,5 +1,8 @@
 #include "platform/holvane/internal/RecordStore.h"
 
+#include <sqlite3.h>
+#include <stdlib.h>
+
 #include "platform/holvane/RegistryError.h"
 #include "platform/vmap/Reader.h"
 #include "platform/vmap/Writer.h"
@@ -58,6 +61,21 @@ Result<Dictionary> decode(const std::vector<std::uint8_t>& bytes, std::string_vi
   return *value->dictionary();
 }
 
+// SQLite's check reports a page it could not read as one more finding
+// ("unable to get the page. error code=N", "failed to get page N") rather
+// than failing. A read that failed says nothing about the file, so such a
+// verdict must not get the file replaced.
+bool checkCouldNotRead(const std::string& findings) {
+  if (findings.find("failed to get page") != std::string::npos) return true;
+  constexpr std::string_view kCode = "error code=";
+  for (std::size_t at = findings.find(kCode); at != std::string::npos;
+       at = findings.find(kCode, at + 1)) {
+    const int primary = ::atoi(findings.c_str() + at + kCode.size()) & 0xff;
+    if (primary != SQLITE_CORRUPT && primary != SQLITE_NOTADB) return true;
+  }
+  return false;
+}
+
 Error corruptRow(std::string_view what) {
   return registryError(RegistryErrorCode::Corrupt, "stored record with " + std::string(what));
 }
@@ -100,11 +118,18 @@ Result<std::unique_ptr<RecordStore>> RecordStore::open(const std::string& path) 
     // journal mode cannot change.
     Result<Statement> check = (*db)->prepare("PRAGMA quick_check");
     if (!check.ok()) return check.error();
-    Result<StepResult> verdict = check->step();
-    if (!verdict.ok()) return verdict.error();
-    if (*verdict == StepResult::Row && check->columnText(0).value_or("") != "ok") {
-      return registryError(RegistryErrorCode::Corrupt,
-                           path + ": " + check->columnText(0).value_or("integrity check failed"));
+    std::string findings;
+    for (;;) {
+      Result<StepResult> verdict = check->step();
+      if (!verdict.ok()) return verdict.error();
+      if (*verdict == StepResult::Done) break;
+      const std::string finding = check->columnText(0).value_or("integrity check failed");
+      if (finding != "ok") findings += (findings.empty() ? "" : "\n") + finding;
+    }
+    if (!findings.empty()) {
+      return registryError(
+          checkCouldNotRead(findings) ? RegistryErrorCode::Storage : RegistryErrorCode::Corrupt,
+          path + ": " + findings);
     }
   }
   // Write-ahead logging with a sync at checkpoints rather than at every

@@ -101,18 +101,26 @@ struct RegistryUnderTest {
   std::shared_ptr<LinuxRegistry> registry;
 };
 
-inline RegistryUnderTest openRegistry(const SystemRoot& root,
-                                      StartupScan scan = StartupScan::Skip,
-                                      ScanLimits limits = {}) {
+// For tests in which opening may fail: the failure is answered, not reported.
+inline Result<RegistryUnderTest> tryOpenRegistry(const SystemRoot& root,
+                                                 StartupScan scan = StartupScan::Skip,
+                                                 ScanLimits limits = {}) {
   RegistryUnderTest made;
   made.sdks = std::make_shared<LinuxSdkRegistry>(root / "System/Library/ExtensionPoints");
   made.entitlements = std::make_shared<codesign::LinuxEntitlementStore>(
       root / "etc/quorvex/entitlements", ::geteuid());
   Result<std::shared_ptr<LinuxRegistry>> opened =
       LinuxRegistry::open(root.locations(), made.sdks, made.entitlements, scan, limits);
-  EXPECT_TRUE(opened.ok()) << (opened.ok() ? "" : opened.error().description());
-  if (opened.ok()) made.registry = *opened;
+  if (!opened.ok()) return opened.error();
+  made.registry = *opened;
   return made;
+}
+
+inline RegistryUnderTest openRegistry(const SystemRoot& root, StartupScan scan = StartupScan::Skip,
+                                      ScanLimits limits = {}) {
+  Result<RegistryUnderTest> opened = tryOpenRegistry(root, scan, limits);
+  EXPECT_TRUE(opened.ok()) << (opened.ok() ? "" : opened.error().description());
+  return opened.ok() ? std::move(opened).value() : RegistryUnderTest{};
 }
 
 }  // namespace platform::holvane::testing
