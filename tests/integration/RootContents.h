@@ -27,6 +27,8 @@ platform::Value readVmapFile(const std::string& path);
 // How often `name` has been posted under the root, read through the notify
 // layer; 0 before the first post.
 std::uint64_t postCount(const TemporaryRoot& root, const std::string& name);
+// What the daemon posts for every change of holds and annotations.
+inline constexpr const char* kChange = "com.corvane.quorvex.annotation-change";
 
 // The "errorcode" and "error" of a reply: {0, ""} for a success, {~0, "no
 // reply"} when there is no dictionary.

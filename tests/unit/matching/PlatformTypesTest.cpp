@@ -83,6 +83,8 @@ TEST_F(TypeDeclarationsOnDisk, GoodFilesCountBadOnesAreSkippedWhole) {
       {"com.example.child", "com.example.loop-a", false},
       {"com.example.loop-a", "com.example.parent", true},
       {"com.example.loop-a", "com.example.loop-a", true},
+      // A cycle neither loops nor invents conformances.
+      {"com.example.loop-b", "com.example.undeclared", false},
       {"com.example.parent", "com.example.child", false},
       {"com.example.bad", "com.example.bad", true},  // equal, though never declared
       {"com.example.hidden", "com.example.parent", false},
@@ -133,7 +135,8 @@ TEST(ActivationRule, Edges) {
       {Dictionary{{"k", nan}}, {{"k", 1}}, false},
       {Dictionary{{"k", "5"}}, {{"k", 1}}, false},
       {Dictionary{{"k", std::numeric_limits<std::uint64_t>::max()}},
-       {{"k", std::numeric_limits<std::uint64_t>::max()}}, true},
+       {{"k", std::numeric_limits<std::uint64_t>::max()}},
+       true},
       {Dictionary{{"k", true}}, {{"k", -1}}, false},
       {Dictionary{{"k", true}}, {{"k", true}}, false},
       {Dictionary{{"k", true}}, {{"k", 1.0}}, false},

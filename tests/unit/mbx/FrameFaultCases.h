@@ -10,16 +10,6 @@
 
 namespace platform::mbx::testing {
 
-inline FrameHeader header(std::uint16_t flags, std::uint64_t id, std::uint32_t length,
-                          std::uint64_t inReplyTo = 0) {
-  FrameHeader h;
-  h.flags = flags;
-  h.messageId = id;
-  h.inReplyTo = inReplyTo;
-  h.bodyLength = length;
-  return h;
-}
-
 // A frame whose length field matches `body`, whatever else it says.
 inline Bytes withBody(const Bytes& body, std::uint16_t flags, std::uint64_t id,
                       std::uint64_t inReplyTo = 0) {

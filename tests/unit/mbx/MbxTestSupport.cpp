@@ -14,7 +14,6 @@
 #include <filesystem>
 #include <thread>
 
-#include "platform/cbor/Cbor.h"
 #include "platform/root/Root.h"
 
 extern char** environ;
@@ -47,17 +46,6 @@ Bytes frameBytes(FrameKind kind, std::uint64_t id, const Value& body, std::uint6
   Bytes frame = encodeFrame(kind, inReplyTo, body).value();
   setMessageId(frame, id);
   return frame;
-}
-
-Bytes rawFrame(const FrameHeader& header, const Bytes& body) {
-  Bytes frame(kFrameHeaderSize);
-  writeHeader(header, std::span<std::uint8_t, kFrameHeaderSize>(frame.data(), kFrameHeaderSize));
-  frame.insert(frame.end(), body.begin(), body.end());
-  return frame;
-}
-
-Bytes cborOf(const Value& value) {
-  return cbor::encode(value).value();
 }
 
 Bytes concat(std::initializer_list<Bytes> parts) {

@@ -14,6 +14,7 @@
 #include <string>
 #include <vector>
 
+#include "platform/cbor/Cbor.h"
 #include "platform/mbx/Frame.h"
 #include "platform/values/Value.h"
 
@@ -44,10 +45,29 @@ class TemporaryRoot {
 
 // A valid frame with message id `id`.
 Bytes frameBytes(FrameKind kind, std::uint64_t id, const Value& body, std::uint64_t inReplyTo = 0);
-// A frame with any header at all (bodyLength as given, not from `body`).
-Bytes rawFrame(const FrameHeader& header, const Bytes& body);
-Bytes cborOf(const Value& value);
 Bytes concat(std::initializer_list<Bytes> parts);
+
+// Frame bytes built by hand, broken or not; the daemon's hostile-client
+// tests use these too, so they are inline and need no library.
+inline FrameHeader header(std::uint16_t flags, std::uint64_t id, std::uint32_t length,
+                          std::uint64_t inReplyTo = 0) {
+  FrameHeader h;
+  h.flags = flags;
+  h.messageId = id;
+  h.inReplyTo = inReplyTo;
+  h.bodyLength = length;
+  return h;
+}
+// A frame with any header at all (bodyLength as given, not from `body`).
+inline Bytes rawFrame(const FrameHeader& header, const Bytes& body) {
+  Bytes frame(kFrameHeaderSize);
+  writeHeader(header, std::span<std::uint8_t, kFrameHeaderSize>(frame.data(), kFrameHeaderSize));
+  frame.insert(frame.end(), body.begin(), body.end());
+  return frame;
+}
+inline Bytes cborOf(const Value& value) {
+  return cbor::encode(value).value();
+}
 
 // A forked child that connects to a socket path, writes prepared bytes and
 // then does what `after` says: read until the server ends the connection
