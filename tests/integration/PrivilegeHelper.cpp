@@ -153,7 +153,9 @@ int orphan(const std::string& socket, const std::string& path, const char* entit
     std::fflush(stdout);
     if (::fork() == 0) {
       // The connection's heir: waits until the pid has passed on, then asks
-      // and reports through `done`.
+      // and reports through `done`. It keeps no write end of `go`, so that
+      // it sees the end of the file if the pid never passes on.
+      ::close(go[1]);
       char byte;
       if (::read(go[0], &byte, 1) != 1) ::_exit(0);
       const std::string outcome = outcomeOf(*client, path) + "\n";
