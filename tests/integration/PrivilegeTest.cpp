@@ -120,6 +120,7 @@ TEST_F(PrivilegeTest, APidTakenOverAfterItsPeerExitedBringsNoEntitlements) {
     if (late) argv.push_back(std::to_string(daemon_.pid()));
     const Finished run = runProcess(argv, root_.path(), 120s);
     ::kill(daemon_.pid(), SIGCONT);
+    if (run.status == 5) GTEST_SKIP() << "pids cannot be handed on here: " << run.err;
     ASSERT_EQ(run.status, 0) << run.out << run.err;
     std::istringstream lines(run.out);
     std::string line, reused, outcome;
