@@ -1,5 +1,6 @@
-// A client that speaks the daemon's wire format itself, one frame at a time,
-// so that it sees every frame the daemon sends: the message system's own
+// A client that speaks the daemon's wire format itself (through the
+// integration tests' RawSocketClient), one frame at a time, so that it sees
+// every frame the daemon sends: the message system's own
 // connection drops a reply nobody waits for, which would hide a second
 // reply to the same request. It numbers its requests itself and counts the
 // replies each id got.
@@ -10,13 +11,12 @@
 #include <chrono>
 #include <cstdint>
 #include <map>
-#include <memory>
 #include <optional>
 #include <string>
-#include <vector>
+#include <utility>
 
-#include "platform/mbx/FrameReader.h"
 #include "platform/values/Value.h"
+#include "tests/integration/RawSocketClient.h"
 
 namespace qvd::load {
 
@@ -24,9 +24,8 @@ class FrameClient {
  public:
   // Connects to the Unix socket at `socketPath`; none when that fails.
   static std::optional<FrameClient> connect(const std::string& socketPath);
-  FrameClient(FrameClient&& other) noexcept;
+  FrameClient(FrameClient&&) noexcept = default;
   FrameClient& operator=(FrameClient&&) = delete;
-  ~FrameClient();
 
   // Sends `body` as a request with the next id and reads until its reply
   // comes, `limit` passes or the connection ends. Any other frame read
@@ -40,29 +39,26 @@ class FrameClient {
 
   // How many replies the request with `id` got.
   int repliesTo(std::uint64_t id) const;
-  std::uint64_t lastId() const { return lastId_; }
+  std::uint64_t lastId() const { return socket_.lastMessageId(); }
   // The first fault seen, or "".
   const std::string& problem() const { return problem_; }
   // Faults other than a missing reply: extra, unknown or unasked frames.
   int strayFrames() const { return strays_; }
 
  private:
-  explicit FrameClient(int fd);
-  // Reads one chunk (waiting at most `limit`) and takes the frames it
-  // completes; `waitingFor` is the id whose reply ends the wait (0: none).
-  // Answers that reply's body once it is taken.
-  enum class Read { Frames, Timeout, Ended };
+  explicit FrameClient(integration::RawSocketClient socket) : socket_(std::move(socket)) {}
+  // Reads one frame (waiting at most `limit`) and files it; `waitingFor` is
+  // the id whose reply ends the wait (0: none). Answers that reply's body
+  // once it is taken.
+  enum class Read { Frame, Timeout, Ended };
   Read readOnce(std::chrono::milliseconds limit, std::uint64_t waitingFor,
                 std::optional<platform::Value>& reply);
   void fault(const std::string& what);
 
-  int fd_ = -1;
-  std::uint64_t lastId_ = 0;
+  integration::RawSocketClient socket_;
   std::map<std::uint64_t, int> replies_;
-  std::unique_ptr<platform::mbx::FrameReader> reader_;
   std::string problem_;
   int strays_ = 0;
-  std::vector<std::uint8_t> buffer_;
 };
 
 }  // namespace qvd::load
