@@ -32,7 +32,9 @@
 #include <cerrno>
 #include <climits>
 #include <cstdio>
+#include <filesystem>
 #include <fstream>
+#include <iterator>
 #include <optional>
 #include <string>
 
@@ -156,6 +158,31 @@ pid_t startUnderPid(pid_t target, const char* entitled) {
   return 0;
 }
 
+// Stops `pid` and waits up to 5 s until every one of its threads has
+// stopped: SIGSTOP only asks, and a thread still running could accept a
+// connection made right after the kill.
+bool stopWholly(pid_t pid) {
+  if (::kill(pid, SIGSTOP) != 0) return false;
+  const std::string tasks = "/proc/" + std::to_string(pid) + "/task";
+  for (int tries = 0; tries < 500; ++tries) {
+    bool allStopped = true;
+    std::error_code error;
+    for (const auto& task : std::filesystem::directory_iterator(tasks, error)) {
+      std::ifstream stat(task.path() / "stat");
+      std::string text((std::istreambuf_iterator<char>(stat)), std::istreambuf_iterator<char>());
+      // The state follows the command name, which is in parentheses.
+      const std::size_t close = text.rfind(')');
+      if (close == std::string::npos || close + 2 >= text.size() || text[close + 2] != 'T') {
+        allStopped = false;
+        break;
+      }
+    }
+    if (allStopped && !error) return true;
+    ::usleep(10'000);
+  }
+  return false;
+}
+
 // A line from `fd`, without its newline; empty at end of file.
 std::string lineFrom(int fd) {
   std::string line;
@@ -167,7 +194,10 @@ std::string lineFrom(int fd) {
 int orphan(const std::string& socket, const std::string& path, const char* entitled, pid_t daemon) {
   int go[2], done[2];
   if (::pipe(go) != 0 || ::pipe(done) != 0) return 2;
-  if (daemon > 0) ::kill(daemon, SIGSTOP);
+  if (daemon > 0 && !stopWholly(daemon)) {
+    ::kill(daemon, SIGCONT);
+    return 3;
+  }
   const pid_t maker = ::fork();
   if (maker == 0) {
     std::optional<RawSocketClient> client = RawSocketClient::connect(socket);

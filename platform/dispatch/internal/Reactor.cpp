@@ -226,6 +226,11 @@ void Reactor::pauseForTesting() {
   }
 }
 
+int Reactor::pollingThreadsForTesting() {
+  std::lock_guard<std::mutex> lock(pauseMu_);
+  return activePolls_;
+}
+
 void Reactor::resumeForTesting() {
   std::lock_guard<std::mutex> lock(pauseMu_);
   // Cleared before anyone may wait again, or they would return at once.

@@ -109,6 +109,8 @@ class Reactor {
   // the same moment". Also used to make waiting threads notice new limits.
   void pauseForTesting();
   void resumeForTesting();
+  // Threads inside wait() (or delivering what it returned) right now.
+  int pollingThreadsForTesting();
 
  private:
   struct Entry {

@@ -253,6 +253,19 @@ PoolCounts ThreadPool::counts() const {
   return counts_;
 }
 
+bool ThreadPool::quietForTesting() const {
+  int idle;
+  {
+    std::lock_guard<std::mutex> lock(mu_);
+    // The caller, when it is a pool thread, is the one thread left running.
+    const int self = tOnPool ? 1 : 0;
+    if (ready_ > 0 || wakePending_ || counts_.running + counts_.blocked != self) return false;
+    idle = counts_.idle;
+  }
+  // Read after mu_ is released, so that the two locks never nest.
+  return Reactor::instance().pollingThreadsForTesting() == idle;
+}
+
 std::uint64_t ThreadPool::handlersRunInPlaceForTesting() const {
   return handlersRunInPlace_.load(std::memory_order_relaxed);
 }

@@ -82,6 +82,10 @@ class ThreadPool {
 
   // Changes the limits of the process-wide pool; existing threads adapt.
   void setLimitsForTesting(const PoolLimits& limits);
+  // True while no job waits, no wake signal is on its way and every thread
+  // but the caller is idle and back in the reactor: the moment from which a
+  // thread starts work only if something wakes it.
+  bool quietForTesting() const;
   // Event handlers run by the thread that took the event, since start.
   std::uint64_t handlersRunInPlaceForTesting() const;
 

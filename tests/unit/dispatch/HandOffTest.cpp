@@ -11,6 +11,7 @@
 #include "platform/dispatch/ScopedBlockingCall.h"
 #include "platform/dispatch/Semaphore.h"
 #include "platform/dispatch/SerialQueue.h"
+#include "platform/dispatch/internal/ThreadPool.h"
 #include "tests/unit/dispatch/TestSupport.h"
 
 namespace platform::dispatch {
@@ -21,12 +22,12 @@ using testing::eventually;
 
 // Runs `post` as a job of a fresh serial queue that then works on for a
 // moment, and answers whether the work it handed on ran on that job's
-// thread. Any thread woken for the work would take it during that moment.
+// thread. The job posts only once every other thread of the pool is back
+// waiting for events, so that on a loaded machine a thread that is still
+// on its way back from an earlier round cannot take the work: only a
+// thread woken for it can, and it would take it during that moment.
 template <typename Post>
 bool ranOnThePostingThread(Post post) {
-  // Lets the previous round's threads go back to waiting: a job posted while
-  // one still runs wakes a second thread, which would arrive in the middle.
-  std::this_thread::sleep_for(1ms);
   auto from = SerialQueue::create("handoff.from");
   auto to = SerialQueue::create("handoff.to");
   std::thread::id poster;
@@ -34,6 +35,7 @@ bool ranOnThePostingThread(Post post) {
   Semaphore done;
   from->async([&] {
     poster = std::this_thread::get_id();
+    EXPECT_TRUE(eventually([] { return internal::ThreadPool::instance().quietForTesting(); }));
     post(*to, [&] {
       runner = std::this_thread::get_id();
       done.signal();
@@ -47,7 +49,7 @@ bool ranOnThePostingThread(Post post) {
 }
 
 TEST(DispatchHandOff, TheCallersThreadTakesTheWorkOnceItsJobReturns) {
-  // A thread that wakes for something else may take the work first, so the
+  // A thread whose idle wait times out may take the work first, so the
   // check is on the share of rounds, not on every one. With async() instead
   // a woken thread wins nearly every round.
   int same = 0;
