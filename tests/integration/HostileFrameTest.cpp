@@ -7,6 +7,9 @@
 #include <sys/resource.h>
 #include <unistd.h>
 
+#include <algorithm>
+#include <climits>
+
 #include "tests/integration/HostileClientFixture.h"
 
 namespace qvd::integration {
@@ -110,40 +113,47 @@ TEST_F(HostileClientTest, ASixteenMiBRequestIsServedAndItsMemoryDoesNotAccumulat
     ASSERT_TRUE(client.has_value());
     EXPECT_EQ(identifiersIn(client->call(whole, 30s)), std::set<std::string>{"com.example.alpha"});
   };
-  auto settled = [&] {
-    EXPECT_TRUE(eventually([&] { return openDescriptors(pid_) <= descriptors; }));
-    return residentKiB(pid_);
-  };
   const long baseline = residentKiB(pid_);
-  roundTrip();
-  const long afterOne = settled();
+  // The daemon frees a request's memory on its own time once the reply is
+  // out: on a loaded machine a reading taken when the connection has gone
+  // may still count a body. So each reading is retried, for up to 10 s,
+  // until the daemon is back under `boundKiB` above the baseline; what it
+  // keeps for good never gets there.
+  auto settledUnder = [&](long boundKiB) {
+    if (!kResidentSetMeansWhatIsKept) boundKiB = LONG_MAX;
+    long resident = 0;
+    EXPECT_TRUE(eventually([&] {
+      resident = residentKiB(pid_);
+      return openDescriptors(pid_) <= descriptors && resident - baseline < boundKiB;
+    })) << baseline
+        << " -> " << resident << " KiB, " << openDescriptors(pid_) << " descriptors";
+    return resident;
+  };
   // Blocks of a body's size are mapped and unmapped, not kept by the
   // allocator: one request leaves less than a body's worth behind.
-  if (kResidentSetMeansWhatIsKept) {
-    EXPECT_LT(afterOne - baseline, 16 * 1024) << baseline << " -> " << afterOne << " KiB";
-  }
+  roundTrip();
+  settledUnder(16 * 1024);
+  if (HasFailure()) return;
   // Many leave a little more in the per-thread arenas, at a level that stops
   // rising: a body kept per request would add 16 MiB each time. (Before the
-  // daemon set its mmap threshold, glibc kept them: 130-155 MiB.)
-  auto peakOver = [&](int rounds) {
-    long peak = 0;
+  // daemon set its mmap threshold, glibc kept them: 130-155 MiB.) The lowest
+  // reading of a series is what it kept; higher ones were still freeing.
+  auto keptOver = [&](int rounds) {
+    long kept = LONG_MAX;
     for (int i = 0; i < rounds; ++i) {
       roundTrip();
-      peak = std::max(peak, settled());
+      kept = std::min(kept, settledUnder(48 * 1024));
+      if (HasFailure()) break;  // each further round would wait its 10 s
     }
-    return peak;
+    return kept;
   };
-  peakOver(2);
-  const long early = peakOver(6);
-  peakOver(10);
-  const long late = peakOver(6);
-  if (!kResidentSetMeansWhatIsKept) {
-    EXPECT_TRUE(stillServing());
-    return;
+  keptOver(2);
+  const long early = keptOver(6);
+  keptOver(10);
+  const long late = keptOver(6);
+  if (kResidentSetMeansWhatIsKept && !HasFailure()) {
+    EXPECT_LT(late - early, 32 * 1024) << baseline << " -> " << early << " -> " << late << " KiB";
   }
-  EXPECT_LT(std::max(early, late) - baseline, 48 * 1024)
-      << baseline << " -> " << early << " -> " << late << " KiB";
-  EXPECT_LT(late - early, 32 * 1024) << baseline << " -> " << early << " -> " << late << " KiB";
   EXPECT_TRUE(stillServing());
 }
 
