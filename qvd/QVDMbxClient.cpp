@@ -179,11 +179,13 @@ void QVDMbxClient::dead() {
 }
 
 void QVDMbxClient::finishDeath() {
-  server_->unholdClient(shared_from_this());
-  const int peerPid = pid();
-  QVLogOps().debug("client %d is dead", peerPid);
   acceptWork_.store(false);
-  probes::clientDone(peerPid);
+  // Told once its holds are gone, so that "dead" in the log means done.
+  const int peerPid = pid();
+  server_->unholdClient(shared_from_this(), [peerPid] {
+    QVLogOps().debug("client %d is dead", peerPid);
+    probes::clientDone(peerPid);
+  });
 }
 
 }  // namespace qvd

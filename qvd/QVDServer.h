@@ -83,8 +83,11 @@ class QVDServer final : public QVDatabase,
   // Removes the first hold whose token is `token` and posts; a token no
   // hold has changes nothing and posts nothing.
   void unholdToken(const platform::Uuid& token);
-  // Removes every hold `client` took, posting once per removed hold.
-  void unholdClient(const std::shared_ptr<QVDMbxClient>& client);
+  // Removes every hold `client` took, posting once per removed hold, then
+  // runs `then` (if any) on the hold queue. Returns at once: many peers may
+  // vanish together, and a pool thread waiting here for each of them would
+  // exhaust the pool. What comes to the hold queue later sees them removed.
+  void unholdClient(std::shared_ptr<QVDMbxClient> client, std::function<void()> then = {});
   // The holds as they are now, in the order they were added.
   std::vector<std::shared_ptr<const QVDPlugInHold>> holds() const;
 

@@ -3,7 +3,8 @@
 // The list lives on the hold queue ("serverSync"); every operation runs
 // there and the caller waits, so a "lock" reply is sent only once its hold
 // is in force and a later match sees it. The hold queue calls out to
-// nothing but the notification post, so waiting on it cannot deadlock.
+// nothing but the notification post, so waiting on it cannot deadlock. The
+// one operation nobody waits for is the release of a dead client's holds.
 #include <cerrno>
 #include <string>
 #include <utility>
@@ -65,21 +66,23 @@ void QVDServer::unholdToken(const platform::Uuid& token) {
   });
 }
 
-void QVDServer::unholdClient(const std::shared_ptr<QVDMbxClient>& client) {
-  const int pid = client->pid();
-  syncQueue_->sync([&] {
-    // One notification per hold: observers count changes.
-    for (auto it = holds_.begin(); it != holds_.end();) {
-      if (!(*it)->isHeldBy(client.get())) {
-        ++it;
-        continue;
-      }
-      QVLogOps().debug("releasing plug-in hold %{public}@ for dead client pid %d", (*it)->uuid(),
-                       pid);
-      it = holds_.erase(it);
-      notifyAnnotationChange();
-    }
-  });
+void QVDServer::unholdClient(std::shared_ptr<QVDMbxClient> client, std::function<void()> then) {
+  syncQueue_->async(
+      [self = shared_from_this(), client = std::move(client), then = std::move(then)] {
+        const int pid = client->pid();
+        // One notification per hold: observers count changes.
+        for (auto it = self->holds_.begin(); it != self->holds_.end();) {
+          if (!(*it)->isHeldBy(client.get())) {
+            ++it;
+            continue;
+          }
+          QVLogOps().debug("releasing plug-in hold %{public}@ for dead client pid %d",
+                           (*it)->uuid(), pid);
+          it = self->holds_.erase(it);
+          self->notifyAnnotationChange();
+        }
+        if (then) then();
+      });
 }
 
 std::vector<std::shared_ptr<const QVDPlugInHold>> QVDServer::holds() const {

@@ -1,8 +1,14 @@
 // The server's own duties: the command line, stopping (holds released, one
-// notification) and releasing a dead client's holds.
+// notification) and releasing a dead client's holds, without a thread per
+// client when many die together.
 #include <gtest/gtest.h>
 
+#include <algorithm>
+#include <memory>
+
 #include "Quorvex/QVDConstants.h"
+#include "platform/dispatch/Semaphore.h"
+#include "platform/dispatch/internal/ThreadPool.h"
 #include "platform/log/LogCaptureForTesting.h"
 #include "platform/log/LoggerRegistry.h"
 #include "qvd/QVDOptions.h"
@@ -18,7 +24,8 @@ TEST(QVDOptionsTest, CommandLines) {
   EXPECT_EQ(standard.serviceName, QVDServiceName);
   EXPECT_EQ(standard.databasePath, std::nullopt);
   EXPECT_EQ(standard.cacheLimit, 1000000u);
-  const QVDOptions set = parseOptions({"qvd", "-S", "a", "-Sb", "-d", "/x", "-c", "12abc", "-v", "-v"});
+  const QVDOptions set =
+      parseOptions({"qvd", "-S", "a", "-Sb", "-d", "/x", "-c", "12abc", "-v", "-v"});
   ASSERT_EQ(set.status, CommandLineStatus::Valid);
   EXPECT_EQ(set.serviceName, "b") << "the last -S wins";
   EXPECT_EQ(set.databasePath, "/x");
@@ -44,7 +51,8 @@ TEST_F(ServerTest, StopReleasesEveryHoldAndPostsOnce) {
     const Uuid token = Uuid::generate();
     server_.server()->addHold(std::make_shared<QVDPlugInHold>(
         token, std::vector<std::shared_ptr<const QVDPlugIn>>{}, std::weak_ptr<QVDMbxClient>()));
-    expected.push_back("releasing plug-in hold " + token.toString() + " because server is stopping");
+    expected.push_back("releasing plug-in hold " + token.toString() +
+                       " because server is stopping");
   }
   EXPECT_EQ(notifications(), 2u) << "one per hold taken";
   platform::log::LoggerRegistry::shared().applyFilterForTesting("debug");
@@ -71,8 +79,8 @@ TEST_F(ServerTest, ADeadClientsHoldsAreReleasedAndNoOtherHolds) {
   auto clients = server_.clients();
   ASSERT_EQ(clients.size(), 2u);
   auto hold = [&](const std::shared_ptr<QVDMbxClient>& client) {
-    auto h = std::make_shared<QVDPlugInHold>(Uuid::generate(),
-                                             std::vector<std::shared_ptr<const QVDPlugIn>>{}, client);
+    auto h = std::make_shared<QVDPlugInHold>(
+        Uuid::generate(), std::vector<std::shared_ptr<const QVDPlugIn>>{}, client);
     server_.server()->addHold(h);
     return h;
   };
@@ -84,6 +92,56 @@ TEST_F(ServerTest, ADeadClientsHoldsAreReleasedAndNoOtherHolds) {
   EXPECT_EQ(server_.server()->holds().front(), kept);
   // One post per hold taken (3) and one per hold released (2).
   EXPECT_TRUE(eventually([&] { return notifications() == 5u; })) << notifications();
+}
+
+// Sets the process's pool limits for its lifetime.
+class ScopedPoolLimits {
+ public:
+  explicit ScopedPoolLimits(int cap) : saved_(Pool::instance().limits()) {
+    platform::dispatch::internal::PoolLimits limits = saved_;
+    limits.cap = cap;
+    Pool::instance().setLimitsForTesting(limits);
+  }
+  ~ScopedPoolLimits() { Pool::instance().setLimitsForTesting(saved_); }
+
+ private:
+  using Pool = platform::dispatch::internal::ThreadPool;
+  const platform::dispatch::internal::PoolLimits saved_;
+};
+
+TEST_F(ServerTest, ClientsDyingTogetherWhileTheHoldQueueIsBusyHoldNoThreads) {
+  // A pool this small would run out at once if each dying client held a
+  // thread until the hold queue got to it.
+  ScopedPoolLimits small(16);
+  constexpr int kClients = 40;
+  std::vector<std::unique_ptr<TestClient>> clients;
+  for (int i = 0; i < kClients; ++i) {
+    clients.push_back(std::make_unique<TestClient>(server_));
+    ASSERT_TRUE(clients.back()->call(request("nope")).ok());
+  }
+  const auto served = server_.clients();
+  ASSERT_EQ(served.size(), static_cast<std::size_t>(kClients));
+  for (int i = 0; i < kClients; i += 10) {
+    server_.server()->addHold(std::make_shared<QVDPlugInHold>(
+        Uuid::generate(), std::vector<std::shared_ptr<const QVDPlugIn>>{}, served[i]));
+  }
+
+  platform::dispatch::Semaphore entered, release;
+  server_.server()->holdQueue()->async([&] {
+    entered.signal();
+    release.wait();
+  });
+  entered.wait();
+  for (auto& client : clients) client->cancel();
+  // Every death is taken in while the hold queue is still busy...
+  EXPECT_TRUE(eventually([&] {
+    return std::none_of(served.begin(), served.end(),
+                        [](const auto& c) { return c->acceptWork(); });
+  }));
+  release.signal();
+  // ...and the holds go once it is free: a post for each taken and released.
+  EXPECT_TRUE(eventually([&] { return server_.server()->holds().empty(); }));
+  EXPECT_TRUE(eventually([&] { return notifications() == 8u; })) << notifications();
 }
 
 }  // namespace

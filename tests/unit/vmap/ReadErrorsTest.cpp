@@ -94,7 +94,7 @@ TEST(VmapReadErrors, DoctypeAndEntitiesAreRefusedAtOnce) {
     ASSERT_FALSE(v.ok());
     EXPECT_EQ(v.error().description(), "2:1: DOCTYPE declarations are not allowed");
     EXPECT_TRUE(hasCode(v.error(), ErrorCode::ForbiddenDeclaration));
-    EXPECT_LT(elapsed, std::chrono::milliseconds(100));
+    EXPECT_LT(elapsed, std::chrono::seconds(1)) << "refused before any expansion";
   }
 }
 
