@@ -122,11 +122,12 @@ TEST_F(HostileClientTest, ASixteenMiBRequestIsServedAndItsMemoryDoesNotAccumulat
   auto settledUnder = [&](long boundKiB) {
     if (!kResidentSetMeansWhatIsKept) boundKiB = LONG_MAX;
     long resident = 0;
-    EXPECT_TRUE(eventually([&] {
+    auto under = [&] {
       resident = residentKiB(pid_);
       return openDescriptors(pid_) <= descriptors && resident - baseline < boundKiB;
-    })) << baseline
-        << " -> " << resident << " KiB, " << openDescriptors(pid_) << " descriptors";
+    };
+    EXPECT_TRUE(eventually(under))
+        << baseline << " -> " << resident << " KiB, " << openDescriptors(pid_) << " descriptors";
     return resident;
   };
   // Blocks of a body's size are mapped and unmapped, not kept by the

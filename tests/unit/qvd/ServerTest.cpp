@@ -24,8 +24,7 @@ TEST(QVDOptionsTest, CommandLines) {
   EXPECT_EQ(standard.serviceName, QVDServiceName);
   EXPECT_EQ(standard.databasePath, std::nullopt);
   EXPECT_EQ(standard.cacheLimit, 1000000u);
-  const QVDOptions set =
-      parseOptions({"qvd", "-S", "a", "-Sb", "-d", "/x", "-c", "12abc", "-v", "-v"});
+  const QVDOptions set = parseOptions({"qvd", "-S", "a", "-Sb", "-d", "/x", "-c", "12abc", "-v", "-v"});
   ASSERT_EQ(set.status, CommandLineStatus::Valid);
   EXPECT_EQ(set.serviceName, "b") << "the last -S wins";
   EXPECT_EQ(set.databasePath, "/x");
@@ -51,8 +50,7 @@ TEST_F(ServerTest, StopReleasesEveryHoldAndPostsOnce) {
     const Uuid token = Uuid::generate();
     server_.server()->addHold(std::make_shared<QVDPlugInHold>(
         token, std::vector<std::shared_ptr<const QVDPlugIn>>{}, std::weak_ptr<QVDMbxClient>()));
-    expected.push_back("releasing plug-in hold " + token.toString() +
-                       " because server is stopping");
+    expected.push_back("releasing plug-in hold " + token.toString() + " because server is stopping");
   }
   EXPECT_EQ(notifications(), 2u) << "one per hold taken";
   platform::log::LoggerRegistry::shared().applyFilterForTesting("debug");
@@ -79,8 +77,8 @@ TEST_F(ServerTest, ADeadClientsHoldsAreReleasedAndNoOtherHolds) {
   auto clients = server_.clients();
   ASSERT_EQ(clients.size(), 2u);
   auto hold = [&](const std::shared_ptr<QVDMbxClient>& client) {
-    auto h = std::make_shared<QVDPlugInHold>(
-        Uuid::generate(), std::vector<std::shared_ptr<const QVDPlugIn>>{}, client);
+    auto h = std::make_shared<QVDPlugInHold>(Uuid::generate(),
+                                             std::vector<std::shared_ptr<const QVDPlugIn>>{}, client);
     server_.server()->addHold(h);
     return h;
   };
@@ -96,6 +94,8 @@ TEST_F(ServerTest, ADeadClientsHoldsAreReleasedAndNoOtherHolds) {
 
 // Sets the process's pool limits for its lifetime.
 class ScopedPoolLimits {
+  using Pool = platform::dispatch::internal::ThreadPool;
+
  public:
   explicit ScopedPoolLimits(int cap) : saved_(Pool::instance().limits()) {
     platform::dispatch::internal::PoolLimits limits = saved_;
@@ -105,7 +105,6 @@ class ScopedPoolLimits {
   ~ScopedPoolLimits() { Pool::instance().setLimitsForTesting(saved_); }
 
  private:
-  using Pool = platform::dispatch::internal::ThreadPool;
   const platform::dispatch::internal::PoolLimits saved_;
 };
 
